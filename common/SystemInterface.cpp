@@ -1,0 +1,3 @@
+#include "SystemInterface.h"
+
+QNCSystemInterface::~QNCSystemInterface() = default;

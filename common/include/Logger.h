@@ -1,0 +1,86 @@
+#pragma once
+// The logging companion: one call writes one time-stamped line to the process's log.
+//
+// Levels are single bits; each call passes exactly one level and its tag:
+//   1 "-H-" halt, 8 "-E-" error, 16 "-W-" warning, 32 "-N-" notice, 64 "-I-" info, 128 "-T-" trace.
+// The log code is the mask of levels that are written (255 = all).
+//
+// A line reads:
+//   2026-11-22 22:51:18.123456 -T- [tid] function (file:line) message
+//
+// Guarantees:
+// - Any thread may log at any time, also while holding a lock of the system, also before
+//   CreateLogger and after destroyLogger. Lines from concurrent threads never interleave or tear.
+// - A message longer than kMaxLine is cut; it never overflows.
+// - Use the QN_LOG_* macros: they test the level before any argument is evaluated, so a call
+//   whose level is masked off costs one relaxed load and a branch.
+// - Lines are buffered. "-H-", "-E-" and "-W-" lines are in the file before the call returns;
+//   other lines within a second. Nothing is lost at exit() (the assertion's exit(1) included),
+//   and SIGSEGV, SIGBUS, SIGABRT and SIGFPE write out what is buffered before the process dies.
+// - Before CreateLogger, lines are kept in memory (bounded); CreateLogger writes at the head of
+//   the log those whose level the mask then in force selects. "-H-", "-E-" and "-W-" lines also go
+//   to standard error at once, so a failed start-up is visible before the log exists. After
+//   destroyLogger only those levels reach standard error.
+// - A log path that cannot be opened is reported on standard error; the process goes on.
+// - No thread of its own exists before CreateLogger, so a fork before it (daemonizing) loses
+//   nothing; the memory of the lines kept so far is inherited by the child.
+
+#include <atomic>
+
+class QNCString;
+
+enum QNELogLevel : unsigned int {
+  QNLL_Halt = 1,
+  QNLL_Error = 8,
+  QNLL_Warning = 16,
+  QNLL_Notice = 32,
+  QNLL_Info = 64,
+  QNLL_Trace = 128,
+};
+
+// The current log code; read through QNIsLogLevelOn.
+extern std::atomic<unsigned int> gsQNLogCode;
+
+inline bool QNIsLogLevelOn(unsigned int aLevel) {
+  return (gsQNLogCode.load(std::memory_order_relaxed) & aLevel) != 0;
+}
+
+// Writes one line when aLevel's bit is set in the log code; writes nothing otherwise.
+void PrintLogMessageWithTimeStamp(unsigned int aLevel, const char* apTag, unsigned int aLine,
+                                  const char* apFunction, const char* apFile, const char* apFormat, ...)
+    __attribute__((format(printf, 6, 7)));
+
+// Opens the log at acrPath for appending (created with mode 0644 if missing) and writes the
+// lines kept since start-up. A second call closes the first log and opens the new path.
+void CreateLogger(const QNCString& acrPath);
+
+// Flushes and closes the log. Later lines of "-H-", "-E-" and "-W-" go to standard error only.
+void destroyLogger();
+
+// Writes out every buffered line now. Blocks until the bytes are handed to the kernel.
+void flushLogger();
+
+void setLogCode(unsigned int aMask);
+void getLogCode(unsigned int& arMask);
+
+// The heartbeat time-out, in seconds, stored for the application's watchdog; the logger keeps it
+// and does nothing else with it. Starts at 30.
+void setHbTimeout(unsigned int aValue);
+void getHbTimeout(unsigned int& arValue);
+
+#define QN_LOG(level, tag, ...)                                                         \
+  do {                                                                                 \
+    if (QNIsLogLevelOn(level))                                                         \
+      PrintLogMessageWithTimeStamp(level, tag, __LINE__, __func__, __FILE__, __VA_ARGS__); \
+  } while (0)
+
+#define QN_LOG_HALT(...) QN_LOG(QNLL_Halt, "-H-", __VA_ARGS__)
+#define QN_LOG_ERROR(...) QN_LOG(QNLL_Error, "-E-", __VA_ARGS__)
+#define QN_LOG_WARNING(...) QN_LOG(QNLL_Warning, "-W-", __VA_ARGS__)
+#define QN_LOG_NOTICE(...) QN_LOG(QNLL_Notice, "-N-", __VA_ARGS__)
+#define QN_LOG_INFO(...) QN_LOG(QNLL_Info, "-I-", __VA_ARGS__)
+#define QN_LOG_TRACE(...) QN_LOG(QNLL_Trace, "-T-", __VA_ARGS__)
+
+// The trace lines on entry to and exit from every operation.
+#define QN_ENTERED() QN_LOG_TRACE("%s", "Entered")
+#define QN_LEFT() QN_LOG_TRACE("%s", "Left")

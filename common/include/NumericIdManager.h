@@ -1,0 +1,7 @@
+#pragma once
+// QNCNumericIdManager (declared here; its contract is completed with its implementation).
+
+class QNCNumericIdManager {
+ public:
+  virtual ~QNCNumericIdManager() = default;
+};

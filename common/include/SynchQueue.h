@@ -1,0 +1,7 @@
+#pragma once
+// QNCSynchQueue (declared here; its contract is completed with its implementation).
+
+class QNCSynchQueue {
+ public:
+  virtual ~QNCSynchQueue() = default;
+};

@@ -1,0 +1,7 @@
+#pragma once
+// QNCThreadComponent (declared here; its contract is completed with its implementation).
+
+class QNCThreadComponent {
+ public:
+  virtual ~QNCThreadComponent() = default;
+};

@@ -1,0 +1,19 @@
+#include "SensorSystem.h"
+
+#include <cstdio>
+
+#include "QNException.h"
+#include "Version.h"
+
+QNCSensorSystem::QNCSensorSystem() {
+  mName = QNCString("qnsensord");
+  mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("1.0.0"), QNPST_Individual, QNPAT_New);
+}
+
+void QNCSensorSystem::setCommandLineArgumentDesc() {}
+
+void QNCSensorSystem::parseConfigFile(QNCString&) {
+  throw QNCNotImplementedEx("qnsensord reads no configuration file", 0);
+}
+
+void QNCSensorSystem::displayHelp() { printf("usage: qnsensord\n"); }

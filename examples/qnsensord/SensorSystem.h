@@ -1,0 +1,13 @@
+#pragma once
+// The system object of qnsensord, the example sensor service.
+
+#include "System.h"
+
+class QNCSensorSystem : public QNCSystem {
+ public:
+  QNCSensorSystem();
+
+  void setCommandLineArgumentDesc() override;
+  void parseConfigFile(QNCString& arConfFilePath) override;
+  void displayHelp() override;
+};

@@ -1,0 +1,22 @@
+// qnsensord: the example sensor service built on libQNSystem.
+
+#include <cstdio>
+
+#include "QNException.h"
+#include "SensorSystem.h"
+#include "SystemGlobals.h"
+
+int main(int argc, char** argv) {
+  try {
+    setSystemObject(new QNCSensorSystem);
+    setLogFilePath("qnsensord.log");
+    SystemMain(argc, argv);
+  } catch (const QNCParentExitEx&) {
+    // The parent side of daemonizing, or "-s" after stopping the running instance.
+    return 0;
+  } catch (const QNCException& acrException) {
+    fprintf(stderr, "qnsensord: %s\n", acrException.what());
+    return 1;
+  }
+  return 0;
+}

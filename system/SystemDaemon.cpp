@@ -1,0 +1,4 @@
+#include "System.h"
+
+void QNCSystem::systemDaemonize(QNCString, QNCString, QNCString, QNCString) {}
+void QNCSystem::waitAndCheckExit(unsigned int) {}

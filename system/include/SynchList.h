@@ -1,0 +1,7 @@
+#pragma once
+// QNCSynchList (declared here; its contract is completed with its implementation).
+
+class QNCSynchList {
+ public:
+  virtual ~QNCSynchList() = default;
+};

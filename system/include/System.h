@@ -1,0 +1,214 @@
+#pragma once
+// QNCSystem: the base of the application's system object, and the meeting point of its threads.
+//
+// One instance exists per process. The application derives from it, creates its object with
+// new, hands it to setSystemObject() and calls SystemMain() (SystemGlobals.h); from then on the
+// driver owns the object and calls the lifecycle operations below in a fixed order on the main
+// thread. Every operation is virtual with a working default, except the three the application
+// must provide: setCommandLineArgumentDesc(), parseConfigFile() and displayHelp(). An override of
+// preInit(), init() or processCommandLine() calls the base operation.
+//
+// What the application provides, at construction or in its overrides:
+//   construction    mName, mVersion, mProcessInstanceManager (with its PID file path); the base
+//                   constructor creates mExitLock and leaves mExitFlag false
+//   construction or init()   mMemoryBufferList and mBufferManager, the numbered tables
+//                   mWaitConditionals, mQueues, mLists, mReaders, mWriters
+//   createThreads() mThreadComponents and mThreadPools
+// The library never adds to these tables. They are complete before the first thread starts and
+// do not change while threads run, so they are read without a lock.
+//
+// Threads: the lifecycle operations run on the main thread. The services (buffers, identifiers,
+// conditionals, channels, queues, lists, settings reads, the exit flag) may be called from any
+// thread once start-up has finished. Locks: mExitLock guards mExitFlag only; mNidCreationLock
+// guards mNumericIdManager only; each conditional, queue, list and buffer bucket has its own.
+// The only nesting is a conditional's lock held while a list's or queue's lock is taken for an
+// emptiness test; the reverse never happens.
+//
+// Numbers given to the numbered services are checked by assertions: a number out of range is a
+// bug of the caller and ends the process with exit status 1.
+
+#include "Os.h"
+#include "Pointer.h"
+#include "QNList.h"
+#include "QNMap.h"
+#include "QNString.h"
+#include "QNVector.h"
+#include "CommandLineParser.h"
+#include "SystemInterface.h"
+
+class QNCBuffer;
+class QNCBufferManager;
+class QNCConditional;
+class QNCIpAddress;
+class QNCKeyValueFormatParser;
+class QNCMultiType;
+class QNCMutex;
+class QNCNumericIdManager;
+class QNCProcessInstanceManager;
+class QNCProtocolHelper;
+class QNCQueueable;
+class QNCReader;
+class QNCSynchList;
+class QNCSynchQueue;
+class QNCThreadComponent;
+class QNCThreadPool;
+class QNCVersion;
+class QNCWriter;
+
+// The elements of a synchronised list and the iterators that walk it.
+using QNCQueueableList = QNCList<QNCPointer<QNCQueueable>>;
+
+class QNCSystem : public QNCSystemInterface {
+ public:
+  ~QNCSystem() override;
+
+  // --- Pooled buffers (BufferManager.h). mBufferManager must be set.
+  void getBuffer(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer) override;
+  void reuseBuffer(QNCPointer<QNCBuffer>& arBuffer) override;
+  void clearBuffer(QNCPointer<QNCBuffer>& arBuffer) override;  // the same as reuseBuffer
+
+  // --- Numeric identifiers, serialised by mNidCreationLock. Available after init().
+  void generateNumericId(unsigned int& arId) override;
+
+  // Wakes one thread waiting on conditional acConditionNo.
+  void signal(unsigned int acConditionNo) override;
+
+  // --- Host facts and the exit flag.
+  virtual QNCPointer<QNCIpAddress>& getAddress();
+  // The exit flag, read under mExitLock. Once true it stays true.
+  virtual bool isSetForExit() const;
+  virtual void setAddress(const QNCPointer<QNCIpAddress>& acrAddress);
+  virtual QNCString& getHostName();
+  virtual void setForExit();
+  virtual QNEOperatingSystem getOs();
+  virtual QNCString& getOsVariant();
+  virtual QNCPointer<QNCVersion>& getVersion();
+  virtual QNCPointer<QNCReader>& getReader(unsigned int acReaderNo);
+  virtual QNCPointer<QNCWriter>& getWriter(unsigned int acWriterNo);
+  virtual QNCPointer<QNCProtocolHelper>& getProtocolHelper();
+
+  // --- Lifecycle (main thread, called by the driver in this order: preInit, processCommandLine,
+  // parseConfigFile, applySettings, markAsRunning, init, createThreads, startThreads,
+  // postThreadsInit, createStartUpEvent; at the end waitForThreads, exitInstanceManagement,
+  // destroy, postDestroy).
+  virtual void preInit();
+  virtual void init();
+  virtual void postDestroy();
+  virtual void destroy();
+  virtual void processCommandLine(int argc, char** argv);
+  // Fills mCommandLineArgumentDesc with every option the application accepts, the common ones
+  // included. Called last in preInit().
+  virtual void setCommandLineArgumentDesc() = 0;
+  // Parses the configuration file and adds its settings; throws QNCNotImplementedEx when the
+  // application reads no file (the driver logs that and goes on).
+  virtual void parseConfigFile(QNCString& arConfFilePath) = 0;
+  virtual void displayVersionAndExit();
+  virtual void displayHelpAndExit();
+  virtual void displayHelp() = 0;
+
+  // --- Single running instance (ProcessInstanceManager.h).
+  virtual bool isAnInstanceRunning();
+  virtual void markAsRunning();
+  virtual void killRunningInstance();
+  virtual void exitInstanceManagement();
+  virtual void getProcStatus(QNCString aPidFilePath);
+
+  virtual void returnNumericId(const unsigned int& acrId);
+
+  // --- Threads.
+  virtual void createThreads();
+  virtual void startThreads();
+  virtual void startThread(unsigned int aIndex);
+  virtual void postThreadsInit();
+  virtual void waitForThreads();
+  // Sets the exit flag, asks every component to exit and finishes every pool. Safe to call more
+  // than once and from the signal dispatcher thread.
+  virtual void makeThreadsToExit();
+  virtual bool isInited(unsigned int aIndex) const;
+
+  // --- Numbered wait conditionals and buffer channels.
+  virtual void wait(unsigned int acConditionNo);
+  virtual void timedWait(unsigned int acConditionNo, unsigned int aWaitTime);
+  virtual void send(unsigned int acWriterNo, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount);
+  virtual void receive(unsigned int acReaderNo, QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
+  virtual void waitForActivity(unsigned int acReaderNo, unsigned int acWaitTime);
+
+  // --- Numbered synchronised queues.
+  virtual void waitOnEmptyQueue(unsigned int acConditionNo, unsigned int acQueueNo);
+  virtual void enqueue(unsigned int acQueueNo, const QNCPointer<QNCQueueable>& acrElement);
+  virtual QNCPointer<QNCQueueable> dequeue(unsigned int acQueueNo);
+  virtual QNCPointer<QNCQueueable> queueFront(unsigned int acQueueNo);
+  virtual void queueClear(unsigned int acQueueNo);
+  virtual bool isQueueEmpty(unsigned int acQueueNo);
+
+  // --- Numbered synchronised lists.
+  virtual void waitOnEmptyList(unsigned int acConditionNo, unsigned int acListNo);
+  virtual void enlist(unsigned int acListNo, const QNCPointer<QNCQueueable>& acrElement);
+  virtual void enlistFront(unsigned int acListNo, const QNCPointer<QNCQueueable>& acrElement);
+  virtual QNCPointer<QNCQueueable> delist(unsigned int acListNo);
+  virtual QNCPointer<QNCQueueable> delistBack(unsigned int acListNo);
+  virtual QNCPointer<QNCQueueable> listFront(unsigned int acListNo);
+  virtual void listClear(unsigned int acListNo);
+  virtual unsigned int listSize(unsigned int acListNo);
+  virtual bool isListEmpty(unsigned int acListNo);
+  virtual void listErase(unsigned int acListNo, QNCQueueableList::iterator& arIterator);
+  virtual QNCQueueableList::const_iterator listBegin(unsigned int acListNo) const;
+  virtual QNCQueueableList::const_iterator listEnd(unsigned int acListNo) const;
+  virtual QNCQueueableList::iterator listBegin(unsigned int acListNo);
+  virtual QNCQueueableList::iterator listEnd(unsigned int acListNo);
+
+  // --- Settings.
+  virtual void applySettings();
+  virtual void getSetting(const QNCString& acrKey, QNCPointer<QNCMultiType>& arValue);
+  virtual void addSetting(const QNCString& acrKey, const QNCPointer<QNCMultiType>& acrValue);
+  virtual void processCommandLineArguments();
+
+  // --- Application hooks.
+  virtual void createStartUpEvent();
+  virtual void createShutDownEvent();
+  virtual void systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString acStdOut, QNCString acStdErr);
+  virtual void destroyThreads();
+
+  // --- Non-virtual members.
+  void checkCommandLine(int argc, char** argv, QNCString& aCommandLine);
+  void processVersionCommandLineArgument();
+  void processHelpCommandLineArgument();
+  void processShutdownCommandLineArgument();
+  void processConfigFileCommandLineArgument();
+  void processDebugLevelCommandLineArgument();
+  void processHbTimeoutCommandLineArgument();
+  void processDaemonizeCommandLineArgument();
+  void processDBReopenIntervalCommandLineArgument();
+  void waitAndCheckExit(unsigned int aSeconds);
+  void getMemoryBufferList(QNCList<unsigned int>& arList) { arList = mMemoryBufferList; }
+
+ protected:
+  // Creates mExitLock; mExitFlag starts false.
+  QNCSystem();
+
+  QNCString mName;
+  QNCPointer<QNCProcessInstanceManager> mProcessInstanceManager;
+  QNCPointer<QNCVersion> mVersion;
+  QNCPointer<QNCIpAddress> mAddress;
+  QNCString mHostName;
+  bool mExitFlag;  // guarded by mExitLock
+  QNEOperatingSystem mOs;
+  QNCString mOsVariant;
+  QNCPointer<QNCProtocolHelper> mProtocolHelper;
+  QNCPointer<QNCCommandLineParser> mCommandLineParser;
+  QNCVector<QNSCommandLineArgumentDesc> mCommandLineArgumentDesc;
+  QNCPointer<QNCKeyValueFormatParser> mConfigFileParser;
+  QNCMap<QNCString, QNCPointer<QNCMultiType>> mSettings;
+  QNCPointer<QNCBufferManager> mBufferManager;
+  QNCPointer<QNCNumericIdManager> mNumericIdManager;  // guarded by mNidCreationLock
+  QNCVector<QNCPointer<QNCThreadComponent>> mThreadComponents;
+  QNCVector<QNCPointer<QNCThreadPool>> mThreadPools;
+  QNCVector<QNCPointer<QNCConditional>> mWaitConditionals;
+  QNCVector<QNCPointer<QNCSynchQueue>> mQueues;
+  QNCVector<QNCPointer<QNCSynchList>> mLists;
+  QNCVector<QNCPointer<QNCReader>> mReaders;
+  QNCVector<QNCPointer<QNCWriter>> mWriters;
+  QNCPointer<QNCMutex> mNidCreationLock;
+  QNCPointer<QNCMutex> mExitLock;
+  QNCList<unsigned int> mMemoryBufferList;
+};

@@ -1,0 +1,50 @@
+#pragma once
+// Helpers for tests that work with real files and real processes.
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <string>
+#include <vector>
+
+namespace qntest {
+
+// A fresh directory under /tmp, removed with its contents by the destructor.
+class TempDir {
+ public:
+  TempDir();
+  ~TempDir();
+  TempDir(const TempDir&) = delete;
+  TempDir& operator=(const TempDir&) = delete;
+  const std::string& path() const { return mPath; }
+  std::string file(const std::string& acrName) const { return mPath + "/" + acrName; }
+
+ private:
+  std::string mPath;
+};
+
+// The whole file ("" when it cannot be read).
+std::string readFile(const std::string& acrPath);
+void writeFile(const std::string& acrPath, const std::string& acrContents);
+
+// Starts a program with the given arguments (argv[0] included) and extra "NAME=value" entries
+// added to the environment; its standard output and error go to the given files (or are kept
+// when empty). Returns the child's pid.
+pid_t spawn(const std::vector<std::string>& acrArgv, const std::vector<std::string>& acrEnv = {},
+            const std::string& acrStdout = "", const std::string& acrStderr = "");
+
+// Waits for the child and returns its exit status, or 128 + the signal that ended it, or -1 when
+// it did not end within the time-out (it is then killed with SIGKILL and reaped).
+int waitExit(pid_t aPid, std::chrono::milliseconds aTimeout = std::chrono::seconds(20));
+
+// Polls until the file contains the text, or the time-out passes.
+bool waitForText(const std::string& acrPath, const std::string& acrText,
+                 std::chrono::milliseconds aTimeout = std::chrono::seconds(10));
+
+// The position of acrText in acrHaystack at or after aFrom, or std::string::npos.
+size_t find(const std::string& acrHaystack, const std::string& acrText, size_t aFrom = 0);
+
+// The path of a program built beside the tests (relative to the build directory).
+std::string builtProgram(const std::string& acrRelativePath);
+
+}  // namespace qntest
