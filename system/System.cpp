@@ -58,6 +58,10 @@ void QNCSystem::preInit() {
 
 void QNCSystem::init() {
   QN_ENTERED();
+  QN_LOG_TRACE("Creating Numeric Id Manager...");
+  mNumericIdManager = QNCPointer<QNCNumericIdManager>(new (std::nothrow) QNCNumericIdManager, QNPST_Individual, QNPAT_New);
+  QN_LOG_TRACE("Creating NID creation lock...");
+  mNidCreationLock = QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex, QNPST_Individual, QNPAT_New);
   QN_LEFT();
 }
 
