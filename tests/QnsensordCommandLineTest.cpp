@@ -149,6 +149,13 @@ TEST_F(QnsensordCommandLineTest, ConfigFileSuppliesTheStartUpSettings) {
   EXPECT_EQ(0u, countLines(lRun.mLog, "-T-"));
 }
 
+// The commented sample shipped beside the example must stay a file qnsensord accepts.
+TEST_F(QnsensordCommandLineTest, ShippedSampleConfigurationStartsTheService) {
+  const QnsensordRun lRun = run({"-c", std::string(QN_SOURCE_DIR) + "/examples/qnsensord.conf"});
+  EXPECT_EQ(0, lRun.mStatus) << lRun.mStderr;
+  EXPECT_TRUE(contains(lRun.mLog, "[" + std::to_string(lRun.mPid) + "] init")) << lRun.mLog;
+}
+
 TEST_F(QnsensordCommandLineTest, ConfigFileWithoutARequiredKeyStopsStartUp) {
   const std::string lPath = writeConfig("DebugLevel = 255\nDaemonize = 0\n");
   const QnsensordRun lRun = run({"-c", lPath});
