@@ -38,16 +38,6 @@ TEST(MultiTypeTest, ConversionToAKindNotHeldIsRefusedWithBothKindsNamed) {
   EXPECT_EQ(16u, static_cast<unsigned int>(lNumber));
 }
 
-TEST(MultiTypeTest, SetChangesKindAndValue) {
-  QNCMultiType lValue(7u);
-  lValue.set("seven");
-  EXPECT_EQ(QNMTK_Text, lValue.getKind());
-  EXPECT_STREQ("seven", lValue.getText().get());
-  EXPECT_THROW((void)static_cast<unsigned int>(lValue), QNCInvalidEx);
-  lValue.set(static_cast<signed char>(-1));
-  EXPECT_EQ(-1, static_cast<signed char>(lValue));
-}
-
 TEST(MultiTypeTest, EncodeThenDecodeRestoresEveryKindAtItsLimits) {
   for (unsigned int lNumber : {0u, 1u, 4294967295u}) {
     QNCMultiType lSource(lNumber);

@@ -224,12 +224,6 @@ TEST_F(SystemCommandLineTest, ShutdownWithNothingRunningKillsNothing) {
   EXPECT_NE(std::string::npos, log().find("No instance running.. cannot kill"));
 }
 
-TEST_F(SystemCommandLineTest, SettingAlreadyPresentStopsProcessingAndKeepsTheOldValue) {
-  mSystem.addSetting("DebugLevel", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(8u)));
-  EXPECT_THROW(mSystem.process({"-d", "16"}), QNCExistsEx);
-  EXPECT_EQ(8u, mSystem.number("DebugLevel"));
-}
-
 TEST(SystemCommandLineDeathTest, ConfigFileDescribedWithoutValueIsAnAssertion) {
   CommandLineTestSystem lSystem(true);
   EXPECT_EXIT(lSystem.process({"-c"}), ::testing::ExitedWithCode(1), "Assertion \\[ __null != lpArg \\] failed");
