@@ -9,14 +9,15 @@
 // truncated, and the file is never deleted: after an instance ends it still names that
 // instance, and only the lock tells whether it runs.
 //
-// A file that does not exist (or cannot be examined) is created empty with mode 0640 as given to
-// open(); the process's umask applies on top of that (a daemon has umask 0, Daemon steps in
-// System.h).
+// A file that does not exist is created empty with mode 0640 as given to open(); the process's
+// umask applies on top of that (a daemon has umask 0, see QNCSystem::systemDaemonize).
 //
 // The lock is an open-file-description lock (Os.h): it belongs to the manager's own open of the
 // file, so nothing else the process does with the same file -- getProcStatusFromPidFile() on the
 // instance's own PID file, another open and close of it -- drops it, and a second manager in the
-// same process on the same file sees it as held by another instance.
+// same process on the same file sees it as held by another instance. The descriptor is inherited
+// by child processes (also across exec) and they share the lock: a child the instance starts
+// that outlives it keeps the instance marked running until the child ends.
 //
 // Threads: the library uses a manager from the main thread only (command line, start-up,
 // shut-down); one thread at a time per object. It holds no mutex: between processes the file lock
