@@ -13,9 +13,11 @@ namespace {
 // No O_TRUNC: a file that open() creates is empty anyway, and one that appeared between the
 // existence check and the open belongs to an instance that started at the same moment --
 // truncating it would erase the id of the instance that goes on running.
-constexpr int kCreateFlags = O_RDWR | O_CREAT;
+// O_CLOEXEC: a program the instance starts must not inherit the descriptor, or it would share the
+// lock and keep the instance marked running after the instance has ended.
+constexpr int kCreateFlags = O_RDWR | O_CREAT | O_CLOEXEC;
 constexpr int kCreateMode = 0640;
-constexpr int kOpenFlags = O_RDWR;
+constexpr int kOpenFlags = O_RDWR | O_CLOEXEC;
 constexpr int kSigTerm = 15;
 constexpr unsigned int kPidBytes = 4;
 constexpr unsigned int kKillAttempts = 10;
@@ -152,7 +154,7 @@ void QNCProcessInstanceManager::getProcStatusFromPidFile(QNCString aPidFilePath)
   QN_LOG_TRACE("Geting to open the pid file %s", aPidFilePath.get());
   // A descriptor of its own: closing it cannot drop the instance lock, which belongs to the
   // manager's open of the file, not to the process.
-  const int lFd = ClibOpen(aPidFilePath.get(), O_RDONLY, 0);
+  const int lFd = ClibOpen(aPidFilePath.get(), O_RDONLY | O_CLOEXEC, 0);
   int lPid = 0;
   try {
     if (ClibRead(lFd, &lPid, kPidBytes) < kPidBytes) lPid = 0;  // a short file names no process

@@ -15,9 +15,9 @@
 // The lock is an open-file-description lock (Os.h): it belongs to the manager's own open of the
 // file, so nothing else the process does with the same file -- getProcStatusFromPidFile() on the
 // instance's own PID file, another open and close of it -- drops it, and a second manager in the
-// same process on the same file sees it as held by another instance. The descriptor is inherited
-// by child processes (also across exec) and they share the lock: a child the instance starts
-// that outlives it keeps the instance marked running until the child ends.
+// same process on the same file sees it as held by another instance. The descriptor is opened
+// close-on-exec, so a program the instance runs does not share the lock. A child made by fork()
+// alone (no exec) does share it while it lives.
 //
 // Threads: the library uses a manager from the main thread only (command line, start-up,
 // shut-down); one thread at a time per object. It holds no mutex: between processes the file lock
