@@ -8,6 +8,8 @@
 #include "KeyValueFormatParser.h"
 #include "Logger.h"
 #include "MultiType.h"
+#include "ProcessInstanceManager.h"
+#include "SystemGlobals.h"
 #include "Version.h"
 
 QNCUsageEx::~QNCUsageEx() = default;
@@ -57,6 +59,11 @@ bool isChannelCount(unsigned int aCount) { return aCount >= 1 && aCount <= kMaxC
 QNCSensorSystem::QNCSensorSystem() {
   mName = QNCString("qnsensord");
   mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("1.0.0"), QNPST_Individual, QNPAT_New);
+  QNCString lPidFilePath;
+  getLogDir(lPidFilePath);
+  lPidFilePath += "/qnsensord.pid";
+  mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
+      new (std::nothrow) QNCProcessInstanceManager(lPidFilePath), QNPST_Individual, QNPAT_New);
 }
 
 void QNCSensorSystem::processCommandLine(int argc, char** argv) {
