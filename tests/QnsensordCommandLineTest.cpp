@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <sstream>
@@ -54,6 +55,27 @@ class QnsensordCommandLineTest : public ::testing::Test {
 
   std::string logPath() const { return mDir.file("qnsensord.log"); }
 
+  // The process that wrote the log's "init" lines, or 0 when there are none.
+  static pid_t initPid(const std::string& acrLog) {
+    const size_t lEnd = acrLog.find("] init (");
+    if (lEnd == std::string::npos) return 0;
+    const size_t lStart = acrLog.rfind('[', lEnd);
+    return static_cast<pid_t>(std::stol(acrLog.substr(lStart + 1, lEnd - lStart - 1)));
+  }
+
+  // Waits until a process that is not our child (a daemon) is gone; stops it with SIGTERM
+  // after 5 s. A zombie counts as gone: whoever adopted it reaps it.
+  static bool waitGone(pid_t aPid) {
+    for (int lTry = 0; lTry < 500; ++lTry) {
+      const std::string lStat = qntest::readFile("/proc/" + std::to_string(aPid) + "/stat");
+      const size_t lState = lStat.rfind(')');
+      if (lStat.empty() || (lState != std::string::npos && lStat.compare(lState, 3, ") Z") == 0)) return true;
+      if (lTry == 250) kill(aPid, SIGTERM);
+      std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    return false;
+  }
+
   std::string writeConfig(const std::string& acrContents) {
     const std::string lPath = mDir.file("qnsensord.conf");
     qntest::writeFile(lPath, acrContents);
@@ -99,6 +121,18 @@ TEST_F(QnsensordCommandLineTest, ShutdownWithNothingRunningEndsWithStatusZero) {
   const QnsensordRun lRun = run({"-s"});
   EXPECT_EQ(0, lRun.mStatus);
   EXPECT_EQ("", lRun.mStdout);
+  EXPECT_EQ(0, access(mDir.file("qnsensord.pid").c_str(), F_OK)) << "looking for an instance creates the PID file";
+}
+
+TEST_F(QnsensordCommandLineTest, NoArgumentsMoveTheServiceIntoTheBackground) {
+  const QnsensordRun lRun = run({});
+  EXPECT_EQ(0, lRun.mStatus) << "the starting process leaves once the daemon exists";
+  ASSERT_TRUE(qntest::waitForText(logPath(), "] init (")) << qntest::readFile(logPath());
+  const std::string lLog = qntest::readFile(logPath());
+  EXPECT_TRUE(contains(lLog, "Running the current process in the background as daemon"));
+  const pid_t lDaemon = initPid(lLog);
+  EXPECT_NE(lRun.mPid, lDaemon);
+  EXPECT_TRUE(waitGone(lDaemon));
 }
 
 TEST_F(QnsensordCommandLineTest, DaemonizeFalseStaysInTheForeground) {
