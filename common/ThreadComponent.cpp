@@ -10,6 +10,10 @@
 #include "QNException.h"
 
 namespace {
+// The component whose body runs on this thread. Tested before any lock is taken: a body that
+// waited for its own exit would otherwise block on the join lock its owner holds while joining.
+thread_local const QNCThreadComponent* gspCurrentComponent = nullptr;
+
 // Throws QNCInvalidEx "<apFormat with the component's name>".
 [[noreturn]] void throwInvalid(const char* apFormat, const QNCString& acrName) {
   char lMessage[QNCException::kMaxMessage];
@@ -72,13 +76,9 @@ bool QNCThreadComponent::isInited() const {
 
 void QNCThreadComponent::waitForExit() {
   QN_ENTERED();
+  if (gspCurrentComponent == this) throwInvalid("Thread '%s' cannot wait for its own exit", mName);
   std::lock_guard<std::mutex> lJoinGuard(mJoinLock);
-  if (mThread.joinable()) {
-    if (mThread.get_id() == std::this_thread::get_id()) {
-      throwInvalid("Thread '%s' cannot wait for its own exit", mName);
-    }
-    mThread.join();
-  }
+  if (mThread.joinable()) mThread.join();
   QN_LEFT();
 }
 
@@ -98,6 +98,7 @@ void QNCThreadComponent::_body() {
   // Nothing may leave a thread function: an escaping exception would call std::terminate and
   // take the whole service down for the fault of one thread. (The library never cancels
   // threads, so no forced-unwind exception passes through the last clause.)
+  gspCurrentComponent = this;
   try {
     run();
   } catch (const QNCException& acrException) {

@@ -11,6 +11,10 @@
 #include "QNException.h"
 
 namespace {
+// The pool this thread works for. Tested before any lock is taken: a worker that waited for its
+// own pool would otherwise block on the join lock its owner holds while joining.
+thread_local const QNCThreadPool* gspCurrentPool = nullptr;
+
 // Formats apFormat with the pool's name into a message for an exception of class E.
 template <class E>
 [[noreturn]] void throwNamed(const char* apFormat, const QNCString& acrName, unsigned int aCode) {
@@ -69,12 +73,8 @@ void QNCThreadPool::finish() {
 
 void QNCThreadPool::waitForThreads() {
   QN_ENTERED();
+  if (gspCurrentPool == this) throwNamed<QNCInvalidEx>("ThreadPool '%s': a worker cannot wait for its own pool", mName, 6);
   std::lock_guard<std::mutex> lJoinGuard(mJoinLock);
-  for (std::thread& lWorker : mWorkers) {
-    if (lWorker.get_id() == std::this_thread::get_id()) {
-      throwNamed<QNCInvalidEx>("ThreadPool '%s': a worker cannot wait for its own pool", mName, 6);
-    }
-  }
   for (std::thread& lWorker : mWorkers) {
     if (lWorker.joinable()) lWorker.join();
   }
@@ -104,6 +104,7 @@ void QNCThreadPool::_abandonStart() {
 }
 
 void QNCThreadPool::_work() {
+  gspCurrentPool = this;
   for (;;) {
     QNTTask lTask;
     {

@@ -31,6 +31,8 @@ class QNCSensorSystem : public QNCSystem {
   // QNCNotFoundEx for a required key that is missing, QNCOpenFailedEx for a missing file.
   void parseConfigFile(QNCString& arConfFilePath) override;
   void displayHelp() override;
+  // One sampler thread and the pool that processes its samples (SensorThreads.cpp).
+  void createThreads() override;
 
   // The one-line synopsis of the options, followed by a line end.
   static void printUsage(FILE* apStream);
