@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <cstdio>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -25,28 +26,34 @@ struct QnsensordRun {
 
 class QnsensordCommandLineTest : public ::testing::Test {
  protected:
-  // Runs qnsensord with its log in this test's directory. A run that has not ended by itself
-  // within 5 s (the service started and keeps running) is stopped with SIGTERM, by which time
-  // its signal handlers are long installed.
-  QnsensordRun run(const std::vector<std::string>& acrArguments) {
+  // Runs qnsensord with its log in this test's directory. A service that starts keeps running:
+  // it is stopped with SIGTERM once its first sample is processed (a second after its signal
+  // handlers are installed), or after 5 s when its log level hides that line.
+  QnsensordRun run(const std::vector<std::string>& acrArguments, bool aFreshLog = true) {
     std::vector<std::string> lArgv{qntest::builtProgram("examples/qnsensord")};
     lArgv.insert(lArgv.end(), acrArguments.begin(), acrArguments.end());
+    // The log is appended to: an earlier run's lines would be taken for this run's.
+    if (aFreshLog) std::remove(logPath().c_str());
+    const size_t lLogBefore = qntest::readFile(logPath()).size();
     QnsensordRun lRun;
     lRun.mPid = qntest::spawn(lArgv, {"QN_LOG_DIR=" + mDir.path()}, mDir.file("stdout"), mDir.file("stderr"));
-    lRun.mStatus = endOfRun(lRun.mPid);
+    lRun.mStatus = endOfRun(lRun.mPid, lLogBefore);
     lRun.mStdout = qntest::readFile(mDir.file("stdout"));
     lRun.mStderr = qntest::readFile(mDir.file("stderr"));
     lRun.mLog = qntest::readFile(logPath());
     return lRun;
   }
 
-  static int endOfRun(pid_t aPid) {
+  // Only log text past aLogBefore counts: a daemon started earlier may share the log.
+  int endOfRun(pid_t aPid, size_t aLogBefore) const {
     const auto lDeadline = std::chrono::steady_clock::now() + std::chrono::seconds(5);
     while (std::chrono::steady_clock::now() < lDeadline) {
       int lStatus = 0;
       if (waitpid(aPid, &lStatus, WNOHANG) == aPid) {
         return WIFEXITED(lStatus) ? WEXITSTATUS(lStatus) : 128 + WTERMSIG(lStatus);
       }
+      const std::string lLog = qntest::readFile(logPath());
+      if (lLog.size() > aLogBefore && contains(lLog.substr(aLogBefore), "Sample 1 processed")) break;
       std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }
     kill(aPid, SIGTERM);
@@ -63,14 +70,13 @@ class QnsensordCommandLineTest : public ::testing::Test {
     return static_cast<pid_t>(std::stol(acrLog.substr(lStart + 1, lEnd - lStart - 1)));
   }
 
-  // Waits until a process that is not our child (a daemon) is gone; stops it with SIGTERM
-  // after 5 s. A zombie counts as gone: whoever adopted it reaps it.
-  static bool waitGone(pid_t aPid) {
+  // Waits until a process that is not our child (a daemon) is gone. A zombie counts as gone:
+  // whoever adopted it reaps it.
+  static bool isGone(pid_t aPid) {
     for (int lTry = 0; lTry < 500; ++lTry) {
       const std::string lStat = qntest::readFile("/proc/" + std::to_string(aPid) + "/stat");
       const size_t lState = lStat.rfind(')');
       if (lStat.empty() || (lState != std::string::npos && lStat.compare(lState, 3, ") Z") == 0)) return true;
-      if (lTry == 250) kill(aPid, SIGTERM);
       std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }
     return false;
@@ -124,15 +130,24 @@ TEST_F(QnsensordCommandLineTest, ShutdownWithNothingRunningEndsWithStatusZero) {
   EXPECT_EQ(0, access(mDir.file("qnsensord.pid").c_str(), F_OK)) << "looking for an instance creates the PID file";
 }
 
-TEST_F(QnsensordCommandLineTest, NoArgumentsMoveTheServiceIntoTheBackground) {
-  const QnsensordRun lRun = run({});
-  EXPECT_EQ(0, lRun.mStatus) << "the starting process leaves once the daemon exists";
-  ASSERT_TRUE(qntest::waitForText(logPath(), "] init (")) << qntest::readFile(logPath());
+// Without arguments the service becomes a daemon; "-s" from a second process stops it.
+TEST_F(QnsensordCommandLineTest, NoArgumentsStartADaemonThatShutdownStops) {
+  const QnsensordRun lStart = run({});
+  EXPECT_EQ(0, lStart.mStatus) << "the starting process leaves once the daemon exists";
+  ASSERT_TRUE(qntest::waitForText(logPath(), "Sample 1 processed")) << qntest::readFile(logPath());
   const std::string lLog = qntest::readFile(logPath());
   EXPECT_TRUE(contains(lLog, "Running the current process in the background as daemon"));
   const pid_t lDaemon = initPid(lLog);
-  EXPECT_NE(lRun.mPid, lDaemon);
-  EXPECT_TRUE(waitGone(lDaemon));
+  ASSERT_NE(0, lDaemon);
+  EXPECT_NE(lStart.mPid, lDaemon);
+
+  const QnsensordRun lStop = run({"-s"}, false);
+  EXPECT_EQ(0, lStop.mStatus) << lStop.mStderr;
+  EXPECT_EQ("qnsensord shutdown successfully.\n", lStop.mStdout);
+  if (!isGone(lDaemon)) {
+    kill(lDaemon, SIGKILL);
+    ADD_FAILURE() << "the daemon survived -s";
+  }
 }
 
 TEST_F(QnsensordCommandLineTest, DaemonizeFalseStaysInTheForeground) {
