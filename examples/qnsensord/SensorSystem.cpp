@@ -178,9 +178,9 @@ void QNCSensorSystem::displayHelp() {
   printUsage(stdout);
   printf("qnsensord, the example sensor service. Options:\n");
   for (const QNSCommandLineArgumentDesc& lrDesc : kOptions) {
-    char lSynopsis[40];
-    snprintf(lSynopsis, sizeof lSynopsis, "%s %s", lrDesc.mOption, lrDesc.mValueName);
-    printf("  %-15s %s\n", lSynopsis, lrDesc.mHelp);
+    // Option and value name padded together to one column.
+    const int lWidth = 14 - static_cast<int>(strlen(lrDesc.mOption));
+    printf("  %s %-*s %s\n", lrDesc.mOption, lWidth > 0 ? lWidth : 0, lrDesc.mValueName, lrDesc.mHelp);
   }
   printf("The log is written to $QN_LOG_DIR/qnsensord.log (/tmp when QN_LOG_DIR is unset).\n");
 }
