@@ -55,7 +55,8 @@ class InterruptingSignal {
       if (lTid != 0 && isSleeping(lTid)) {
         const int lBefore = gsHandled;
         pthread_kill(lThread.native_handle(), SIGUSR1);
-        for (int lWait = 0; lWait < 500 && gsHandled == lBefore; ++lWait) std::this_thread::sleep_for(milliseconds(2));
+        for (int lWait = 0; lWait < 500 && gsHandled == lBefore; ++lWait)
+          std::this_thread::sleep_for(milliseconds(2));
         lInterrupted = gsHandled != lBefore;
       }
     }
@@ -119,7 +120,8 @@ TEST_F(ClibTest, FailuresNameTheCallTheObjectAndTheSystemText) {
     ClibClose(lWriteOnly);
     ADD_FAILURE() << "closed a descriptor twice";
   } catch (QNCCloseFailedEx& arFailure) {
-    EXPECT_EQ("close fd " + std::to_string(lWriteOnly) + ": Bad file descriptor", std::string(arFailure.what()));
+    EXPECT_EQ("close fd " + std::to_string(lWriteOnly) + ": Bad file descriptor",
+              std::string(arFailure.what()));
   }
   EXPECT_THROW(ClibChdir(lMissing.c_str()), QNCOpenFailedEx);
 }
@@ -143,7 +145,8 @@ TEST_F(ClibTest, WriteToAPipeNobodyReadsReportsBrokenPipe) {
 
 TEST_F(ClibTest, ReadAndWriteCarryEveryByteThroughAPipe) {
   std::string lSent(300000, '\0');  // several times the pipe's capacity: writes block and split
-  for (size_t lIndex = 0; lIndex < lSent.size(); ++lIndex) lSent[lIndex] = static_cast<char>(lIndex * 7 + lIndex / 251);
+  for (size_t lIndex = 0; lIndex < lSent.size(); ++lIndex)
+    lSent[lIndex] = static_cast<char>(lIndex * 7 + lIndex / 251);
   unsigned int lWritten = 0;
   std::thread lWriter([&] {
     lWritten = ClibWrite(mPipe[1], lSent.data(), static_cast<unsigned int>(lSent.size()));
@@ -152,7 +155,8 @@ TEST_F(ClibTest, ReadAndWriteCarryEveryByteThroughAPipe) {
   });
   std::string lReceived;
   char lChunk[7000];
-  for (unsigned int lRead; (lRead = ClibRead(mPipe[0], lChunk, sizeof lChunk)) > 0;) lReceived.append(lChunk, lRead);
+  for (unsigned int lRead; (lRead = ClibRead(mPipe[0], lChunk, sizeof lChunk)) > 0;)
+    lReceived.append(lChunk, lRead);
   lWriter.join();
   EXPECT_EQ(lSent.size(), lWritten);
   EXPECT_TRUE(lSent == lReceived) << "received " << lReceived.size() << " bytes, not the ones sent";
@@ -233,7 +237,8 @@ TEST_F(ClibTest, ProcStatusTellsExistingFromGoneAndRefusesGroups) {
     ADD_FAILURE() << "a reaped child still exists";
   } catch (QNCClibGetProcStatusFailedEx& arFailure) {
     EXPECT_EQ(static_cast<unsigned int>(ESRCH), arFailure.getCode());
-    EXPECT_EQ("kill(signal 0) pid " + std::to_string(lChild) + ": No such process", std::string(arFailure.what()));
+    EXPECT_EQ("kill(signal 0) pid " + std::to_string(lChild) + ": No such process",
+              std::string(arFailure.what()));
   }
 
   // kill(0, 0) and kill(-1, 0) would succeed (they probe process groups): refusal proves they

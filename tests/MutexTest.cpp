@@ -76,7 +76,8 @@ TEST(MutexTest, FailedDestructionIsTracedAndIgnored) {
     if (lLine.find("~QNCMutex") != std::string::npos) lLines.push_back(lLine);
   }
   ASSERT_EQ(5u, lLines.size()) << lText;
-  const char* const kExpected[] = {"Entered", "Left", "Entered", "Ignoring exception in Mutex destruction ...", "Left"};
+  const char* const kExpected[] = {"Entered", "Left", "Entered",
+                                   "Ignoring exception in Mutex destruction ...", "Left"};
   for (size_t lIndex = 0; lIndex < lLines.size(); ++lIndex) {
     EXPECT_NE(std::string::npos, lLines[lIndex].find(" -T- ")) << lLines[lIndex];
     const std::string& lLine = lLines[lIndex];

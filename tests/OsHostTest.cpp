@@ -49,7 +49,8 @@ TEST(OsHostTest, IpAddressIsOneOfThisHostsInHostByteOrder) {
   if (lCandidates.empty()) {
     EXPECT_EQ(0x7F000001u, lAddress);
   } else {
-    EXPECT_EQ(1u, lCandidates.count(lAddress)) << std::hex << lAddress << " is no non-loopback address of this host";
+    EXPECT_EQ(1u, lCandidates.count(lAddress))
+        << std::hex << lAddress << " is no non-loopback address of this host";
   }
   // Binding succeeds only to an address of this host: a swapped byte order would fail here.
   const int lSocket = socket(AF_INET, SOCK_DGRAM, 0);

@@ -58,7 +58,7 @@ unsigned int ClibWrite(int aFd, const void* apBuffer, unsigned int aCount) {
       continue;
     }
     const int lErrno = lResult < 0 ? errno : EIO;  // 0 bytes for a non-zero count: no progress possible
-    if (lErrno == EINTR) continue;                  // interrupted before anything was written
+    if (lErrno == EINTR) continue;                 // interrupted before anything was written
     OsThrowFdError<QNCWriteFailedEx>(lErrno, "write", aFd);
   }
   return lWritten;

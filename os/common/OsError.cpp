@@ -6,7 +6,8 @@
 #include <cstdio>
 #include <cstring>
 
-void OsFormatError(char* apBuffer, unsigned long aSize, int aErrno, const char* apCall, const char* apObject) {
+void OsFormatError(char* apBuffer, unsigned long aSize, int aErrno, const char* apCall,
+                   const char* apObject) {
   char lText[256];
   // The GNU strerror_r returns the text, which may or may not be lText.
   const char* lpText = strerror_r(aErrno, lText, sizeof lText);

@@ -34,7 +34,8 @@ void OsLockFile(int aFd) {
   if (lErrno == 0) return;
   // EAGAIN (or EACCES on some systems) means another open of the file holds a lock; say so, as
   // "Resource temporarily unavailable" alone would leave the reader guessing.
-  if (lErrno != EAGAIN && lErrno != EACCES) OsThrowFdError<QNCFileLockFailedEx>(lErrno, "fcntl(F_OFD_SETLK)", aFd);
+  if (lErrno != EAGAIN && lErrno != EACCES)
+    OsThrowFdError<QNCFileLockFailedEx>(lErrno, "fcntl(F_OFD_SETLK)", aFd);
   char lFd[QNCException::kMaxMessage / 2];
   OsDescribeFd(lFd, sizeof lFd, aFd);
   char lObject[QNCException::kMaxMessage / 2 + 32];

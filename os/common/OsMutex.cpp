@@ -55,7 +55,8 @@ void OsWait(pthread_cond_t& arCondition, pthread_mutex_t& arMutex) {
   if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_cond_wait");
 }
 
-int OsConditionalTimedWait(pthread_cond_t& arCondition, pthread_mutex_t& arMutex, unsigned int aMilliseconds) {
+int OsConditionalTimedWait(pthread_cond_t& arCondition, pthread_mutex_t& arMutex,
+                           unsigned int aMilliseconds) {
   struct timespec lDeadline;
   clock_gettime(CLOCK_MONOTONIC, &lDeadline);  // cannot fail: the clock exists and the pointer is valid
   lDeadline.tv_sec += static_cast<time_t>(aMilliseconds / 1000);

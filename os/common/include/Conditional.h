@@ -30,7 +30,9 @@ class QNCConditional {
 
   // As wait(), but at most aMilliseconds milliseconds. A time-out throws QNCTimeOutEx with the
   // mutex held again: the caller unlocks it.
-  void timedWait(unsigned int aMilliseconds) { OsConditionalTimedWait(mCondition, mMutex.getMutex(), aMilliseconds); }
+  void timedWait(unsigned int aMilliseconds) {
+    OsConditionalTimedWait(mCondition, mMutex.getMutex(), aMilliseconds);
+  }
 
   // Wakes one waiting thread, none if none waits. Never throws.
   void signal() { OsSignal(mCondition); }
