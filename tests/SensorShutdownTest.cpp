@@ -13,7 +13,7 @@ namespace {
 class SensorShutdownTest : public ::testing::Test {
  protected:
   pid_t start() {
-    return qntest::spawn({qntest::builtProgram("examples/qnsensord")}, {"QN_LOG_DIR=" + mDir.path()},
+    return qntest::spawn({qntest::builtProgram("examples/qnsensord"), "-D", "false"}, {"QN_LOG_DIR=" + mDir.path()},
                          mDir.file("stdout"), mDir.file("stderr"));
   }
 
