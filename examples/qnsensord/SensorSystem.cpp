@@ -2,12 +2,17 @@
 
 #include <cstdio>
 
+#include "BufferManager.h"
 #include "QNException.h"
 #include "Version.h"
 
 QNCSensorSystem::QNCSensorSystem() {
   mName = QNCString("qnsensord");
   mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("1.0.0"), QNPST_Individual, QNPAT_New);
+  // Replies are small status frames up to one page; ascending lengths make first fit best fit.
+  for (const unsigned int lLength : {64u, 256u, 1024u, 4096u}) mMemoryBufferList.pushBack(lLength);
+  mBufferManager =
+      QNCPointer<QNCBufferManager>(new (std::nothrow) QNCBufferManager(this), QNPST_Individual, QNPAT_New);
 }
 
 void QNCSensorSystem::setCommandLineArgumentDesc() {}
