@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "Assert.h"
+#include "BufferManager.h"
 #include "KeyValueFormatParser.h"
 #include "Logger.h"
 #include "MultiType.h"
@@ -64,6 +65,10 @@ QNCSensorSystem::QNCSensorSystem() {
   lPidFilePath += "/qnsensord.pid";
   mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
       new (std::nothrow) QNCProcessInstanceManager(lPidFilePath), QNPST_Individual, QNPAT_New);
+  // Replies are small status frames up to one page; ascending lengths make first fit best fit.
+  for (const unsigned int lLength : {64u, 256u, 1024u, 4096u}) mMemoryBufferList.pushBack(lLength);
+  mBufferManager =
+      QNCPointer<QNCBufferManager>(new (std::nothrow) QNCBufferManager(this), QNPST_Individual, QNPAT_New);
 }
 
 void QNCSensorSystem::processCommandLine(int argc, char** argv) {
