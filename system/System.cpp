@@ -84,6 +84,7 @@ void QNCSystem::init() {
   mNumericIdManager = QNCPointer<QNCNumericIdManager>(new (std::nothrow) QNCNumericIdManager, QNPST_Individual, QNPAT_New);
   QN_LOG_TRACE("Creating NID creation lock...");
   mNidCreationLock = QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex, QNPST_Individual, QNPAT_New);
+  mProtocolHelper = QNCPointer<QNCProtocolHelper>(new (std::nothrow) QNCProtocolHelper(100), QNPST_Individual, QNPAT_New);
   QN_LEFT();
 }
 
