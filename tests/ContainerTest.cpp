@@ -141,21 +141,6 @@ TEST_F(ContainerTest, EmptyListOperationsAreNotFoundAndLeaveItUsable) {
   expectThrown<QNCNotFoundEx>([&] { lList.popFront(); }, "Not Found", 8);
 }
 
-TEST_F(ContainerTest, ListEraseReturnsTheFollowingElement) {
-  QNCList<int> lList;
-  for (int lValue = 1; lValue <= 4; ++lValue) lList.pushBack(lValue);
-  auto lAt = lList.begin();
-  ++lAt;
-  lAt = lList.erase(lAt);
-  ASSERT_NE(lList.end(), lAt);
-  EXPECT_EQ(3, *lAt);
-  int lSum = 0;
-  for (int lValue : lList) lSum += lValue;
-  EXPECT_EQ(1 + 3 + 4, lSum);
-  lList.clear();
-  EXPECT_TRUE(lList.isEmpty());
-}
-
 TEST_F(ContainerTest, ListPushFailureIsOutOfMemoryAndLeavesItUnchanged) {
   QNCList<QNSFragile> lList;
   lList.pushBack(QNSFragile(1));

@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <cstring>
-
 #include "DeathTestSupport.h"
 #include "QNString.h"
 
@@ -65,20 +63,6 @@ TEST(StringTest, AppendChangesInPlaceAndChains) {
   lText += lText;  // appending itself reads the text before it grows
   EXPECT_STREQ("abcabc", lText.get());
   EXPECT_EQ(6u, lText.length());
-}
-
-TEST(StringTest, SelfAssignmentKeepsTheText) {
-  QNCString lText("same");
-  const QNCString& lrAlias = lText;
-  lText = lrAlias;
-  EXPECT_STREQ("same", lText.get());
-}
-
-TEST(StringTest, TextIsCopiedAtConstruction) {
-  char lBuffer[] = "volatile";
-  const QNCString lText(lBuffer);
-  memset(lBuffer, 'x', sizeof lBuffer - 1);
-  EXPECT_STREQ("volatile", lText.get());
 }
 
 TEST(StringDeathTest, NullTextIsAnAssertion) {
