@@ -78,6 +78,10 @@ class QNCPointer {
         mReferenceCount(acrCopy.mReferenceCount),
         mSizeType(acrCopy.mSizeType),
         mAllocationType(acrCopy.mAllocationType) {
+    // The last reference may be this one, and delete through a base without a virtual
+    // destructor would skip the derived part.
+    static_assert(std::is_same<std::remove_cv_t<T>, std::remove_cv_t<U>>::value || std::has_virtual_destructor<T>::value,
+                  "a QNCPointer to a base class needs a virtual destructor in the base");
     QN_ASSERT(0 != acrCopy.mPointer);
     QN_ASSERT(0 != acrCopy.mReferenceCount);
     QN_ASSERT(QNPST_Individual == acrCopy.mSizeType);
