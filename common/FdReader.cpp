@@ -1,0 +1,90 @@
+#include "FdReader.h"
+
+#include <new>
+
+#include "Buffer.h"
+#include "Clib.h"
+#include "OsStream.h"
+
+QNCFdReader::QNCFdReader(int aFd, bool aOwnsFd, unsigned int aStagingSize)
+    : mFd(aFd),
+      mOwnsFd(aOwnsFd),
+      mpStaging(nullptr),
+      mStagingSize(aStagingSize == 0 ? 1 : aStagingSize),
+      mStagedBegin(0),
+      mStagedEnd(0),
+      mEnded(false) {
+  mpStaging = new (std::nothrow) unsigned char[mStagingSize];
+  if (mpStaging == nullptr) throw QNCNoMemoryEx("Out of Memory", 2);
+  try {
+    OsSetNonBlocking(mFd);
+  } catch (QNCException&) {
+    delete[] mpStaging;
+    throw;
+  }
+}
+
+QNCFdReader::~QNCFdReader() {
+  delete[] mpStaging;
+  if (mOwnsFd) {
+    try {
+      ClibClose(mFd);
+    } catch (QNCException&) {
+      // Nothing can be done about a failed close in a destructor; the descriptor is gone anyway.
+    }
+  }
+}
+
+void QNCFdReader::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) {
+  QNCMutexLocker lGuard(mLock);
+  unsigned char* lpTarget = *arBuffer;
+  const unsigned int lWanted = arBuffer->getLength();
+  arCount = 0;
+  if (lWanted == 0) return;
+  if (mStagedBegin == mStagedEnd) {
+    if (lWanted >= mStagingSize) {
+      // A large read gains nothing from staging: read straight into the caller's buffer.
+      const long lRead = OsReadSome(mFd, lpTarget, lWanted);
+      if (lRead < 0) throw QNCTryAgainEx("Resource temporarily unavailable", 11);
+      arCount = static_cast<unsigned int>(lRead);
+      return;
+    }
+    if (mEnded) return;  // end of the stream, seen before
+    const long lRead = OsReadSome(mFd, mpStaging, mStagingSize);
+    if (lRead < 0) throw QNCTryAgainEx("Resource temporarily unavailable", 11);
+    if (lRead == 0) {
+      mEnded = true;
+      return;
+    }
+    mStagedBegin = 0;
+    mStagedEnd = static_cast<unsigned int>(lRead);
+  }
+  const unsigned int lStaged = mStagedEnd - mStagedBegin;
+  const unsigned int lDelivered = lStaged < lWanted ? lStaged : lWanted;
+  ClibMemcpy(lpTarget, mpStaging + mStagedBegin, lDelivered);
+  mStagedBegin += lDelivered;
+  arCount = lDelivered;
+}
+
+bool QNCFdReader::atEndOfStream() {
+  QNCMutexLocker lGuard(mLock);
+  if (mStagedBegin != mStagedEnd) return false;
+  if (mEnded) return true;
+  const long lRead = OsReadSome(mFd, mpStaging, mStagingSize);
+  if (lRead <= 0) {
+    mEnded = lRead == 0;
+    return mEnded;
+  }
+  mStagedBegin = 0;
+  mStagedEnd = static_cast<unsigned int>(lRead);
+  return false;
+}
+
+bool QNCFdReader::waitForActivity(unsigned int acWaitTime) {
+  {
+    QNCMutexLocker lGuard(mLock);
+    if (mStagedBegin != mStagedEnd) return true;
+  }
+  // Not under the lock: a reader thread must be able to read while another thread waits here.
+  return OsWaitReadable(mFd, acWaitTime);
+}
