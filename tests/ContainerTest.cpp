@@ -176,11 +176,47 @@ TEST_F(ContainerTest, QueueKeepsItsHeadWhenTheCopyFails) {
   lQueue.enqueue(QNSFragile(1));
   lQueue.enqueue(QNSFragile(2));
   QNSFragile::sFailCopies = true;
-  EXPECT_THROW((void)lQueue.dequeue(), std::bad_alloc);
+  expectThrown<QNCNoMemoryEx>([&] { (void)lQueue.dequeue(); }, "Out of Memory", 2);
   expectThrown<QNCNoMemoryEx>([&] { lQueue.enqueue(QNSFragile(3)); }, "Out of Memory", 2);
   QNSFragile::sFailCopies = false;
   EXPECT_EQ(1, lQueue.dequeue().mValue);
   EXPECT_EQ(2, lQueue.dequeue().mValue);
+  EXPECT_TRUE(lQueue.isEmpty());
+}
+
+// An element the queue recycles nodes for (default-constructible, moved without throwing) whose
+// copies fail on request: the copy into a recycled node must fail like a fresh allocation.
+struct QNSRecyclable {
+  static bool sFailCopies;
+  QNSRecyclable() noexcept = default;
+  explicit QNSRecyclable(int aValue) noexcept : mValue(aValue) {}
+  QNSRecyclable(const QNSRecyclable& acrOther) : mValue(acrOther.mValue) {
+    if (sFailCopies) throw std::bad_alloc();
+  }
+  QNSRecyclable(QNSRecyclable&&) noexcept = default;
+  QNSRecyclable& operator=(const QNSRecyclable& acrOther) {
+    if (sFailCopies) throw std::bad_alloc();
+    mValue = acrOther.mValue;
+    return *this;
+  }
+  QNSRecyclable& operator=(QNSRecyclable&&) noexcept = default;
+  int mValue = 0;
+};
+bool QNSRecyclable::sFailCopies = false;
+
+TEST_F(ContainerTest, QueueCopyIntoARecycledNodeFailsAsOutOfMemory) {
+  QNSRecyclable::sFailCopies = false;
+  QNCQueue<QNSRecyclable> lQueue;
+  lQueue.enqueue(QNSRecyclable(1));
+  lQueue.enqueue(QNSRecyclable(2));
+  EXPECT_EQ(1, lQueue.dequeue().mValue);  // leaves a node to recycle
+  QNSRecyclable::sFailCopies = true;
+  expectThrown<QNCNoMemoryEx>([&] { lQueue.enqueue(QNSRecyclable(3)); }, "Out of Memory", 2);
+  QNSRecyclable::sFailCopies = false;
+  EXPECT_EQ(1u, lQueue.numberOfElements());
+  lQueue.enqueue(QNSRecyclable(4));
+  EXPECT_EQ(2, lQueue.dequeue().mValue);
+  EXPECT_EQ(4, lQueue.dequeue().mValue);
   EXPECT_TRUE(lQueue.isEmpty());
 }
 
