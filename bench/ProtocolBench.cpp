@@ -93,15 +93,16 @@ void tcpPair(int aFds[2]) {
 }
 
 // A 64-byte framed request is echoed by a second thread; each iteration is one round trip.
-// The helpers retry after 1 ms: a body may arrive a moment after its prefix.
+// The readers wait up to 50 ms for bytes, so a body that trails its prefix costs no retry sleep.
 void roundTrips(benchmark::State& arState, int aFds[2]) {
   qnbench::setTraceLogging(false);
   const int lClientDup = dup(aFds[0]);
   const int lServerDup = dup(aFds[1]);
   QNCPointer<QNCWriter> lClientWriter(new QNCFdWriter(aFds[0]), QNPST_Individual, QNPAT_New);
-  QNCPointer<QNCReader> lClientReader(new QNCFdReader(lClientDup), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCReader> lClientReader(new QNCFdReader(lClientDup, true, QNCFdReader::kDefaultStagingSize, 50),
+                                      QNPST_Individual, QNPAT_New);
   QNCPointer<QNCWriter> lServerWriter(new QNCFdWriter(aFds[1]), QNPST_Individual, QNPAT_New);
-  QNCFdReader* lpServerReader = new QNCFdReader(lServerDup);
+  QNCFdReader* lpServerReader = new QNCFdReader(lServerDup, true, QNCFdReader::kDefaultStagingSize, 50);
   QNCPointer<QNCReader> lServerReader(lpServerReader, QNPST_Individual, QNPAT_New);
   QNCProtocolHelper lHelper(1);
   std::thread lEcho([&] {
