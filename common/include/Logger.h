@@ -10,24 +10,39 @@
 //
 // Guarantees:
 // - Any thread may log at any time, also while holding a lock of the system, also before
-//   CreateLogger and after destroyLogger. Lines from concurrent threads never interleave or tear.
-// - A message longer than kMaxLine is cut; it never overflows.
+//   CreateLogger and after destroyLogger. Lines from concurrent threads never interleave or tear:
+//   each line is formatted apart and copied whole into the shared buffer under its lock.
+// - A line longer than kQNLogMaxLine bytes (header and newline included) is cut; it never
+//   overflows. A newline inside a message becomes a space, so one call is always one line.
+// - Logging never changes errno.
 // - Use the QN_LOG_* macros: they test the level before any argument is evaluated, so a call
 //   whose level is masked off costs one relaxed load and a branch.
 // - Lines are buffered. "-H-", "-E-" and "-W-" lines are in the file before the call returns;
-//   other lines within a second. Nothing is lost at exit() (the assertion's exit(1) included),
-//   and SIGSEGV, SIGBUS, SIGABRT and SIGFPE write out what is buffered before the process dies.
-// - Before CreateLogger, lines are kept in memory (bounded); CreateLogger writes at the head of
-//   the log those whose level the mask then in force selects. "-H-", "-E-" and "-W-" lines also go
-//   to standard error at once, so a failed start-up is visible before the log exists. After
-//   destroyLogger only those levels reach standard error.
-// - A log path that cannot be opened is reported on standard error; the process goes on.
+//   other lines within a second (a flusher thread, started by CreateLogger, writes what has
+//   gathered every 200 ms). Nothing is lost at exit() (the assertion's exit(1) included): the
+//   buffer is written by an atexit handler, and lines logged after it (static destructors) are
+//   written through at once. SIGSEGV, SIGBUS, SIGABRT and SIGFPE write out what is buffered
+//   before the process dies: CreateLogger installs a handler for each that writes the buffer,
+//   restores the default action and re-raises, so the process still dies of that signal. An
+//   application that wants its own handler for these signals installs it after CreateLogger.
+// - Before CreateLogger, lines are kept in memory (at most 1 MiB; lines beyond are counted and
+//   the count is logged at the head of the log); CreateLogger writes at the head of the log those
+//   whose level the mask then in force selects. "-H-", "-E-" and "-W-" lines also go to standard
+//   error at once, so a failed start-up is visible before the log exists; no other line ever
+//   reaches standard error. After destroyLogger only those levels reach standard error.
+// - A log path that cannot be opened is reported on standard error; the process goes on and the
+//   logger stays as it was (still keeping lines in memory, or still writing the log already open).
 // - No thread of its own exists before CreateLogger, so a fork before it (daemonizing) loses
-//   nothing; the memory of the lines kept so far is inherited by the child.
+//   nothing; the memory of the lines kept so far is inherited by the child. A child forked after
+//   CreateLogger drops the parent's unwritten lines (the parent writes them), appends its own to
+//   the same file, and starts its own flusher at its first line.
 
 #include <atomic>
 
 class QNCString;
+
+// The longest line written, in bytes, header and newline included.
+constexpr unsigned int kQNLogMaxLine = 2048;
 
 enum QNELogLevel : unsigned int {
   QNLL_Halt = 1,
@@ -51,10 +66,13 @@ void PrintLogMessageWithTimeStamp(unsigned int aLevel, const char* apTag, unsign
     __attribute__((format(printf, 6, 7)));
 
 // Opens the log at acrPath for appending (created with mode 0644 if missing) and writes the
-// lines kept since start-up. A second call closes the first log and opens the new path.
+// lines kept since start-up. A second call writes out and closes the first log and opens the new
+// path. Never throws; a path that cannot be opened is reported on standard error. Call it from
+// one thread at a time (start-up does).
 void CreateLogger(const QNCString& acrPath);
 
-// Flushes and closes the log. Later lines of "-H-", "-E-" and "-W-" go to standard error only.
+// Writes out and closes the log and stops the flusher thread. Later lines of "-H-", "-E-" and
+// "-W-" go to standard error only. Blocks until the flusher has ended.
 void destroyLogger();
 
 // Writes out every buffered line now. Blocks until the bytes are handed to the kernel.

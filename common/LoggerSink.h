@@ -1,0 +1,76 @@
+#pragma once
+// QNCLogSink: where formatted log lines go. One per process, created at the first line and never
+// destroyed, so that exit handlers, static destructors and crash handlers can always reach it.
+//
+// States: kept in memory (before CreateLogger, or while no log could be opened), open (lines are
+// buffered and written to the log file), closed (after destroyLogger: only urgent lines, to
+// standard error). Urgent lines are those of "-H-", "-E-" and "-W-".
+//
+// Buffering: lines are copied into the active batch under mLock; a batch is written by swapping it
+// with the spare one under mLock and writing the spare under mWriteLock, so writers keep appending
+// while a batch is on its way to the kernel. Lock order: mWriteLock, then mLock.
+//
+// Any thread, at any time. write() blocks only for the copy, or for a batch write when the batch is
+// full or the line is urgent.
+
+#include <pthread.h>
+
+#include <condition_variable>
+#include <cstddef>
+#include <mutex>
+
+#include "LoggerStartupLines.h"
+
+class QNCLogSink {
+ public:
+  static QNCLogSink& instance();
+
+  // Takes one formatted line (newline included) of level aLevel.
+  void write(unsigned int aLevel, const char* apLine, size_t aLength);
+
+  // Opens apPath for appending and makes it the log; writes the lines kept in memory whose level
+  // is in aMask at its head. Starts the flusher, installs the crash handlers and the exit handler.
+  // Returns false, leaving everything as it was, when the file cannot be opened (errno is set).
+  bool open(const char* apPath, unsigned int aMask);
+
+  // Writes out and closes the log; stops the flusher. Nothing happens when no log is open.
+  void close();
+
+  // Writes out every buffered line; blocks until the bytes are handed to the kernel.
+  void flush();
+
+  // For the crash handlers: writes out the buffered lines with async-signal-safe calls only.
+  // Waits a bounded time for the locks and then writes regardless: the process is dying.
+  void flushFromCrash();
+
+ private:
+  enum QNESinkState { QNSS_Memory, QNSS_Open, QNSS_Closed };
+  static constexpr size_t kBatch = 64 * 1024;
+
+  QNCLogSink();
+  void _writeBatch();
+  void _startFlusher();
+  void _runFlusher();
+  void _atExit();
+  static void* __flusherMain(void* apSink);
+  static void __onExit();
+  static void __forkPrepare();
+  static void __forkParent();
+  static void __forkChild();
+
+  std::mutex mWriteLock;  // guards mpSpare and the order of batch writes to mFd
+  char* mpSpare;
+
+  std::mutex mLock;  // guards every member below
+  QNESinkState mState = QNSS_Memory;
+  int mFd = -1;
+  char* mpActive;
+  size_t mUsed = 0;
+  bool mWriteThrough = false;    // after the exit handler: every line is written at once
+  bool mFlusherRunning = false;  // a flusher thread exists in this process
+  bool mStopFlusher = false;
+  pthread_t mFlusher{};
+  std::condition_variable mFlusherWake;  // a first line in an empty batch, or a stop request
+  QNCLogStartupLines mStartup;
+  char mBatches[2][kBatch];
+};
