@@ -6,8 +6,9 @@
 // trace figures include formatting and the logger's write path but never fill a disk.
 //
 //   SameThread      get + reuse of one size from one thread.
-//   CrossThread     buffers taken on one thread and returned (or dropped) on another, handed
-//                   over in batches of 512 (few enough handovers that scheduling does not dominate) as the service's worker and consumer threads do.
+//   CrossThread     buffers taken on one thread and returned (or dropped) on another, as the
+//                   service's threads do; handed over in batches of 512, so that few handovers
+//                   happen and thread scheduling does not dominate the figure.
 //   TwoThreads      two threads each taking and returning, on one bucket or on two.
 
 #include <benchmark/benchmark.h>
