@@ -138,12 +138,12 @@ TEST_F(BufferManagerTest, IdleBuffersComeBackFirstInFirstOut) {
   QNCPointer<QNCBuffer> lA = take(*lManager, 10);
   QNCPointer<QNCBuffer> lB = take(*lManager, 10);
   QNCPointer<QNCBuffer> lC = take(*lManager, 10);
-  lManager->reuse(lB);
-  lManager->reuse(lC);
-  lManager->reuse(lA);
-  EXPECT_EQ(lB.get(), take(*lManager, 1).get());
-  EXPECT_EQ(lC.get(), take(*lManager, 1).get());
-  EXPECT_EQ(lA.get(), take(*lManager, 1).get());
+  // The first round fills fresh queue nodes, the second the recycled ones.
+  QNCPointer<QNCBuffer>* const lRounds[2][3] = {{&lB, &lC, &lA}, {&lA, &lC, &lB}};
+  for (const auto& lRound : lRounds) {
+    for (QNCPointer<QNCBuffer>* lpBuffer : lRound) lManager->reuse(*lpBuffer);
+    for (QNCPointer<QNCBuffer>* lpBuffer : lRound) EXPECT_EQ(lpBuffer->get(), take(*lManager, 1).get());
+  }
   // The queue is empty again: the next buffer is new.
   const QNCPointer<QNCBuffer> lNew = take(*lManager, 1);
   EXPECT_TRUE(lNew.get() != lA.get() && lNew.get() != lB.get() && lNew.get() != lC.get());
