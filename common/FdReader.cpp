@@ -68,6 +68,14 @@ void QNCFdReader::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) {
   ClibMemcpy(lpTarget, mpStaging + mStagedBegin, lDelivered);
   mStagedBegin += lDelivered;
   arCount = lDelivered;
+  // The staging buffer is empty and much is still wanted: take what is already there straight
+  // into the caller's buffer rather than through another round of staging.
+  const unsigned int lRest = lWanted - lDelivered;
+  if (lRest >= mStagingSize && !mEnded) {
+    const long lRead = OsReadSome(mFd, lpTarget + lDelivered, lRest);
+    if (lRead > 0) arCount += static_cast<unsigned int>(lRead);
+    mEnded = lRead == 0;
+  }
 }
 
 bool QNCFdReader::atEndOfStream() {
