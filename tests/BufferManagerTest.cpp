@@ -124,15 +124,6 @@ TEST_F(BufferManagerTest, ReusedBufferComesBackWithItsOldBytesAndTheNewLength) {
   EXPECT_EQ(1u, linesWith("Got buffer of 256 length from bucket # 1").size());
 }
 
-TEST_F(BufferManagerTest, GetReplacesWhatTheCallersPointerHeld) {
-  auto lManager = makeManager({64});
-  QNCPointer<QNCBuffer> lBuffer = take(*lManager, 8);
-  QNCPointer<QNCBuffer> lWatch = lBuffer;
-  lManager->get(8, lBuffer);
-  EXPECT_NE(lWatch.get(), lBuffer.get());
-  EXPECT_EQ(8u, lWatch->getLength());
-}
-
 TEST_F(BufferManagerTest, IdleBuffersComeBackFirstInFirstOut) {
   auto lManager = makeManager({64});
   QNCPointer<QNCBuffer> lA = take(*lManager, 10);
