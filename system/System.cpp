@@ -1,6 +1,7 @@
 #include "System.h"
 
 #include "BufferManager.h"
+#include "Clib.h"
 #include "Conditional.h"
 #include "IpAddress.h"
 #include "KeyValueFormatParser.h"
@@ -53,11 +54,32 @@ QNCPointer<QNCProtocolHelper>& QNCSystem::getProtocolHelper() { return mProtocol
 
 void QNCSystem::preInit() {
   QN_ENTERED();
+  OsGetOsName(mOs, mOsVariant);
+  QN_LOG_TRACE("Creating Command Line Parser...");
+  mCommandLineParser =
+      QNCPointer<QNCCommandLineParser>(new (std::nothrow) QNCCommandLineParser, QNPST_Individual, QNPAT_New);
+  QN_LOG_TRACE("Creating Config File Parser...");
+  mConfigFileParser = QNCPointer<QNCKeyValueFormatParser>(
+      new (std::nothrow) QNCKeyValueFormatParser(QNCString(""), QNCString(""), false, false), QNPST_Individual,
+      QNPAT_New);
+  QN_LOG_TRACE("Setting the command line argument descriptor");
+  setCommandLineArgumentDesc();
   QN_LEFT();
 }
 
 void QNCSystem::init() {
   QN_ENTERED();
+  char lHostName[256];
+  ClibGethostname(lHostName, 256);
+  mHostName = QNCString(lHostName);
+  QN_LOG_NOTICE("HostName: %s", mHostName.get());
+  QN_LOG_TRACE("Setting IP Address...");
+  unsigned int lAddress = 0;
+  OsGetIpAddress(lAddress);
+  QN_LOG_INFO("The IP Address of the host in number form: %u ", lAddress);
+  QN_LOG_TRACE("Setting the IP Address");
+  mAddress = QNCPointer<QNCIpAddress>(new (std::nothrow) QNCIpAddress(lAddress), QNPST_Individual, QNPAT_New);
+  QN_LOG_NOTICE("IpAddress: %s", mAddress->getStringForm());
   QN_LEFT();
 }
 
@@ -78,11 +100,23 @@ void QNCSystem::createThreads() {
 
 void QNCSystem::startThreads() {
   QN_ENTERED();
+  // Single threads first, then pools, each in index order. Nothing is caught: a thread that
+  // cannot start ends start-up, and the ones after it are not started.
+  for (unsigned int lIndex = 0; lIndex < mThreadComponents.numberOfElements(); ++lIndex) {
+    mThreadComponents[lIndex]->init();
+    QN_LOG_NOTICE("Started Thread: %s", mThreadComponents[lIndex]->getName().get());
+  }
+  for (unsigned int lIndex = 0; lIndex < mThreadPools.numberOfElements(); ++lIndex) {
+    mThreadPools[lIndex]->init();
+    QN_LOG_NOTICE("Started Threads in Thread Pool: %s", mThreadPools[lIndex]->getName().get());
+  }
   QN_LEFT();
 }
 
-void QNCSystem::startThread(unsigned int) {
+void QNCSystem::startThread(unsigned int aIndex) {
   QN_ENTERED();
+  mThreadComponents[aIndex]->init();
+  QN_LOG_NOTICE("Started Thread: %s", mThreadComponents[aIndex]->getName().get());
   QN_LEFT();
 }
 
@@ -90,15 +124,38 @@ void QNCSystem::postThreadsInit() {}
 
 void QNCSystem::waitForThreads() {
   QN_ENTERED();
+  // Sequential: a component that ended early is reaped only after every one before it.
+  for (unsigned int lIndex = 0; lIndex < mThreadComponents.numberOfElements(); ++lIndex) {
+    QN_LOG_NOTICE("Waiting for '%s' thread to exit", mThreadComponents[lIndex]->getName().get());
+    mThreadComponents[lIndex]->waitForExit();
+  }
+  for (unsigned int lIndex = 0; lIndex < mThreadPools.numberOfElements(); ++lIndex) {
+    QN_LOG_NOTICE("Waiting for threads in '%s' ThreadPool to exit", mThreadPools[lIndex]->getName().get());
+    mThreadPools[lIndex]->waitForThreads();
+  }
   QN_LEFT();
 }
 
 void QNCSystem::makeThreadsToExit() {
   createShutDownEvent();
   setForExit();
+  for (unsigned int lIndex = 0; lIndex < mThreadComponents.numberOfElements(); ++lIndex) {
+    // One component that cannot take the request (never started) must not keep the others,
+    // or the pools, from being told: the shut-down would then hang in waitForThreads.
+    try {
+      mThreadComponents[lIndex]->requestExit();
+    } catch (const QNCInvalidEx&) {
+    }
+  }
+  for (unsigned int lIndex = 0; lIndex < mThreadPools.numberOfElements(); ++lIndex) {
+    mThreadPools[lIndex]->finish();
+  }
 }
 
-bool QNCSystem::isInited(unsigned int) const { return false; }
+bool QNCSystem::isInited(unsigned int aIndex) const {
+  if (aIndex >= mThreadComponents.numberOfElements()) return false;
+  return mThreadComponents[aIndex]->isInited();
+}
 
 void QNCSystem::createStartUpEvent() {}
 void QNCSystem::createShutDownEvent() {}

@@ -49,6 +49,10 @@ class QNCKeyValueFormatParser {
  private:
   struct QNSEntry;
 
+  bool _sameKey(const QNCString& acrStored, const QNCString& acrKey) const;
+  // The entry of the key; throws QNCNotFoundEx.
+  const QNSEntry& _find(const QNCString& acrKey) const;
+
   QNCString mFilePath;
   QNCString mCommentMarkers;
   bool mCaseInsensitiveKeys;

@@ -1,7 +1,81 @@
 #pragma once
-// QNCThreadComponent (declared here; its contract is completed with its implementation).
+// QNCThreadComponent: one named thread of the application.
+//
+// The application derives from it and writes the thread's body in run(). The system object
+// starts the component with init(), asks it to end with requestExit() and joins it with
+// waitForExit(). A body learns of the request either by testing isExitRequested() or, better,
+// by sleeping in waitForExitRequest(), which the request interrupts at once: a body never has
+// to poll faster than its own work needs.
+//
+// An exception that escapes run() ends the thread, not the process: it is logged at error level
+// "Thread '<name>' ended by an exception: <message>" and waitForExit() returns as for a normal
+// end. (Without this, an exception leaving a thread function calls std::terminate.)
+//
+// Threads: init() and waitForExit() are for the owner (the main thread in the system's
+// lifecycle); requestExit(), isExitRequested() and isInited() may be called from any thread at
+// any time, also concurrently with each other. mLock guards mExitRequested and mStarted only and
+// is never held while the body or a virtual operation runs.
+//
+// Lifetime: the owner joins the thread (waitForExit) before the object is destroyed. As a last
+// resort the destructor requests exit and joins a thread that is still running, so the process
+// never reaches std::terminate; but by then the derived part is gone, so a body that still runs
+// at that point must not touch members of the derived class. A body never destroys its own
+// component.
+
+#include <condition_variable>
+#include <mutex>
+#include <thread>
+
+#include "QNString.h"
 
 class QNCThreadComponent {
  public:
-  virtual ~QNCThreadComponent() = default;
+  explicit QNCThreadComponent(const QNCString& acrName);
+  QNCThreadComponent(const QNCThreadComponent&) = delete;
+  QNCThreadComponent& operator=(const QNCThreadComponent&) = delete;
+  virtual ~QNCThreadComponent();
+
+  // Asks the thread to end: wakes waitForExitRequest() and makes isExitRequested() true for good.
+  // Does not block. A request to a thread that has already ended has no effect. May be called
+  // more than once. An override (to also wake a body blocked elsewhere) calls this operation.
+  // Throws QNCInvalidEx "Thread '<name>' was never started" before init() has succeeded: there is
+  // no thread to tell, and the request is not remembered.
+  virtual void requestExit();
+
+  // Starts the thread, which runs run(). Throws QNCInvalidEx "Thread '<name>' already started"
+  // on a second call, QNCOsException when the system cannot create the thread (the component then
+  // stays not started).
+  void init();
+
+  // True once init() has started the thread; stays true after the thread has ended.
+  bool isInited() const;
+
+  // Blocks until the thread has ended. Returns at once when it was never started or has already
+  // been joined. Throws QNCInvalidEx when called from the component's own thread.
+  void waitForExit();
+
+  // True once requestExit() has been called on the started thread.
+  bool isExitRequested() const;
+
+  QNCString& getName() { return mName; }
+
+ protected:
+  // The thread's body. It returns when its work is done or when an exit has been requested.
+  virtual void run() = 0;
+
+  // Sleeps until exit is requested or aMilliseconds have passed (a steady clock: changes of the
+  // wall clock neither shorten nor stretch it). Returns true when exit has been requested, also
+  // when the request came before the call. Spurious wake-ups are absorbed.
+  bool waitForExitRequest(unsigned int aMilliseconds);
+
+ private:
+  void _body();
+
+  QNCString mName;
+  mutable std::mutex mLock;  // guards mExitRequested, mStarted
+  std::condition_variable mExitRequest;
+  bool mExitRequested;
+  bool mStarted;
+  std::mutex mJoinLock;  // guards mThread: one joiner at a time
+  std::thread mThread;
 };

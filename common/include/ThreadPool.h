@@ -1,7 +1,80 @@
 #pragma once
-// QNCThreadPool (declared here; its contract is completed with its implementation).
+// QNCThreadPool: a named pool of worker threads that run submitted tasks in submission order
+// (each task on whichever worker is free, so tasks of one pool may run at the same time).
+//
+// Life of a pool: construction (threads counted, none running) -> init() (workers start and
+// take tasks) -> finish() (no new task accepted; the workers run what is queued, then end) ->
+// waitForThreads() (joins them).
+//
+// Decisions a user relies on:
+// - finish() drains: every task submitted before finish() runs before the workers end. It does
+//   not interrupt a running task; a long task should watch its own exit condition.
+// - A submission after finish() is refused with QNCExitConditionEx
+//   "ThreadPool '<name>' is finished: task refused"; a task is never dropped silently.
+// - Tasks submitted before init() wait in the queue and run once the workers start.
+// - A task that throws is logged at error level "ThreadPool '<name>': task failed: <message>"
+//   and its worker goes on with the next task; the process does not end.
+//
+// Threads: submit(), finish() and getName() may be called from any thread, also from a task and
+// from the signal dispatcher; finish() never blocks. init() and waitForThreads() are for the
+// owner. mLock guards mTasks, mFinished, mStarted and is never held while a task runs.
+//
+// Lifetime: the owner calls finish() and waitForThreads() before destroying the pool; the
+// destructor does both if they were not done, so the process never reaches std::terminate.
+
+#include <condition_variable>
+#include <deque>
+#include <functional>
+#include <mutex>
+#include <thread>
+#include <vector>
+
+#include "QNString.h"
 
 class QNCThreadPool {
  public:
-  virtual ~QNCThreadPool() = default;
+  using QNTTask = std::function<void()>;
+
+  // aThreadCount workers; throws QNCInvalidEx "ThreadPool '<name>' needs at least one thread"
+  // for 0.
+  QNCThreadPool(const QNCString& acrName, unsigned int aThreadCount);
+  QNCThreadPool(const QNCThreadPool&) = delete;
+  QNCThreadPool& operator=(const QNCThreadPool&) = delete;
+  virtual ~QNCThreadPool();
+
+  // Starts the workers. Throws QNCInvalidEx "ThreadPool '<name>' already started" on a second
+  // call; QNCOsException when a thread cannot be created (the workers already made are then
+  // finished and joined, and the pool counts as started: a further init() is refused).
+  virtual void init();
+
+  // Stops accepting tasks and lets the workers end once the queue is empty. Does not block.
+  // Idempotent.
+  virtual void finish();
+
+  // Blocks until every worker has ended, that is until finish() has been called and the queue
+  // has drained. Returns at once when the pool was never started or has been joined already.
+  // Throws QNCInvalidEx when called from one of the pool's own workers.
+  virtual void waitForThreads();
+
+  // Queues a task. Throws QNCInvalidEx for an empty function, QNCExitConditionEx after finish(),
+  // QNCNoMemoryEx when the queue cannot grow.
+  virtual void submit(QNTTask aTask);
+
+  QNCString& getName() { return mName; }
+  unsigned int getThreadCount() const { return mThreadCount; }
+
+ private:
+  void _abandonStart();
+  void _work();
+  void _run(QNTTask& arTask);
+
+  QNCString mName;
+  const unsigned int mThreadCount;
+  std::mutex mLock;  // guards mTasks, mFinished, mStarted
+  std::condition_variable mWork;
+  std::deque<QNTTask> mTasks;
+  bool mFinished;
+  bool mStarted;
+  std::mutex mJoinLock;  // guards mWorkers: one starter or joiner at a time
+  std::vector<std::thread> mWorkers;
 };

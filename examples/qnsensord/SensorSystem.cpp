@@ -2,12 +2,19 @@
 
 #include <cstdio>
 
+#include "ProcessInstanceManager.h"
 #include "QNException.h"
+#include "SystemGlobals.h"
 #include "Version.h"
 
 QNCSensorSystem::QNCSensorSystem() {
   mName = QNCString("qnsensord");
   mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("1.0.0"), QNPST_Individual, QNPAT_New);
+  QNCString lPidFilePath;
+  getLogDir(lPidFilePath);
+  lPidFilePath += "/qnsensord.pid";
+  mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
+      new (std::nothrow) QNCProcessInstanceManager(lPidFilePath), QNPST_Individual, QNPAT_New);
 }
 
 void QNCSensorSystem::setCommandLineArgumentDesc() {}

@@ -10,4 +10,6 @@ class QNCSensorSystem : public QNCSystem {
   void setCommandLineArgumentDesc() override;
   void parseConfigFile(QNCString& arConfFilePath) override;
   void displayHelp() override;
+  // One sampler thread and the pool that processes its samples (SensorThreads.cpp).
+  void createThreads() override;
 };

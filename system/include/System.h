@@ -166,6 +166,15 @@ class QNCSystem : public QNCSystemInterface {
   // --- Application hooks.
   virtual void createStartUpEvent();
   virtual void createShutDownEvent();
+  // Moves the process into the background; called by applySettings() before the logger exists
+  // and before any thread is started (fork copies only the calling thread, and every descriptor
+  // is closed). Returns only in the daemon: a grandchild in a session of its own but not its
+  // leader, SIGHUP ignored, umask 0, working directory acDir (must not be empty: asserted),
+  // descriptors 0, 1, 2 open on acStdIn, acStdOut, acStdErr and no other descriptor open.
+  // The starting process and the first child leave by QNCParentExitEx (19). Throws
+  // QNCProcessCreationFailedEx (345) when fork fails, QNCExitConditionEx (19) when the descriptor
+  // limit cannot be read, SIGHUP cannot be ignored or the three files cannot become 0, 1, 2, and
+  // what ClibChdir throws.
   virtual void systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString acStdOut, QNCString acStdErr);
   virtual void destroyThreads();
 
@@ -179,6 +188,9 @@ class QNCSystem : public QNCSystemInterface {
   void processHbTimeoutCommandLineArgument();
   void processDaemonizeCommandLineArgument();
   void processDBReopenIntervalCommandLineArgument();
+  // Sleeps about aSeconds, checking the exit flag every 5 seconds and at the end, so a request to
+  // stop is noticed within 5 seconds (plus the last remainder). Throws QNCHaltEx "Process is
+  // marked for exit." (1) once the flag is set. Any thread; holds no lock while it sleeps.
   void waitAndCheckExit(unsigned int aSeconds);
   void getMemoryBufferList(QNCList<unsigned int>& arList) { arList = mMemoryBufferList; }
 

@@ -1,0 +1,197 @@
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "Logger.h"
+#include "QNException.h"
+#include "TestSupport.h"
+#include "ThreadPool.h"
+
+namespace {
+
+// A latch the tests open by hand; tasks block on it.
+class Gate {
+ public:
+  void open() {
+    {
+      std::lock_guard<std::mutex> lGuard(mLock);
+      mOpen = true;
+    }
+    mChanged.notify_all();
+  }
+  void pass() {
+    std::unique_lock<std::mutex> lGuard(mLock);
+    mChanged.wait(lGuard, [this] { return mOpen; });
+  }
+
+ private:
+  std::mutex mLock;
+  std::condition_variable mChanged;
+  bool mOpen = false;
+};
+
+TEST(ThreadPoolTest, EveryTaskRunsExactlyOnce) {
+  constexpr unsigned int kTasks = 2000;
+  std::vector<std::atomic<int>> lRuns(kTasks);
+  QNCThreadPool lPool("counters", 3);
+  lPool.init();
+  for (unsigned int lIndex = 0; lIndex < kTasks; ++lIndex) {
+    lPool.submit([&lRuns, lIndex] { ++lRuns[lIndex]; });
+  }
+  lPool.finish();
+  lPool.waitForThreads();
+  for (unsigned int lIndex = 0; lIndex < kTasks; ++lIndex) ASSERT_EQ(1, lRuns[lIndex].load()) << "task " << lIndex;
+}
+
+TEST(ThreadPoolTest, TasksQueuedBeforeInitRunOnceTheWorkersStart) {
+  std::atomic<int> lRan{0};
+  QNCThreadPool lPool("early", 1);
+  lPool.submit([&] { ++lRan; });
+  lPool.submit([&] { ++lRan; });
+  lPool.init();
+  lPool.finish();
+  lPool.waitForThreads();
+  EXPECT_EQ(2, lRan);
+}
+
+// Two tasks that each wait for the other can only both finish if two workers run at once.
+// The waits are bounded so that a pool that serialises its tasks fails instead of hanging.
+TEST(ThreadPoolTest, WorkersRunTasksAtTheSameTime) {
+  std::mutex lLock;
+  std::condition_variable lArrived;
+  int lCount = 0;
+  std::atomic<int> lMet{0};
+  auto lRendezvous = [&] {
+    std::unique_lock<std::mutex> lGuard(lLock);
+    ++lCount;
+    lArrived.notify_all();
+    if (lArrived.wait_for(lGuard, std::chrono::seconds(30), [&] { return lCount == 2; })) ++lMet;
+  };
+  QNCThreadPool lPool("pair", 2);
+  lPool.init();
+  lPool.submit(lRendezvous);
+  lPool.submit(lRendezvous);
+  lPool.finish();
+  lPool.waitForThreads();
+  EXPECT_EQ(2, lMet);
+}
+
+// finish() while every worker is busy: what was queued before still runs, a submission after
+// it is refused with a clear exception, and the workers then end.
+TEST(ThreadPoolTest, FinishWhileTasksRunDrainsTheQueueAndRefusesLaterTasks) {
+  Gate lGate;
+  std::atomic<int> lBusy{0};
+  std::atomic<int> lBlockersDone{0};
+  std::atomic<int> lQueuedDone{0};
+  QNCThreadPool lPool("drain", 2);
+  lPool.init();
+  for (int lIndex = 0; lIndex < 2; ++lIndex) {
+    lPool.submit([&] {
+      ++lBusy;
+      lGate.pass();
+      ++lBlockersDone;
+    });
+  }
+  for (int lIndex = 0; lIndex < 5; ++lIndex) lPool.submit([&] { ++lQueuedDone; });
+  while (lBusy.load() < 2) std::this_thread::yield();  // both workers are inside a task
+
+  lPool.finish();
+  try {
+    lPool.submit([] {});
+    FAIL() << "a task submitted after finish() must be refused";
+  } catch (const QNCExitConditionEx& acrException) {
+    EXPECT_STREQ("ThreadPool 'drain' is finished: task refused", acrException.what());
+  }
+  lGate.open();
+  lPool.waitForThreads();
+  EXPECT_EQ(2, lBlockersDone);
+  EXPECT_EQ(5, lQueuedDone);
+}
+
+TEST(ThreadPoolTest, AFailingTaskIsLoggedAndItsWorkerGoesOn) {
+  qntest::TempDir lDir;
+  const std::string lLog = lDir.file("pool.log");
+  CreateLogger(QNCString(lLog.c_str()));
+  std::atomic<int> lAfter{0};
+  {
+    QNCThreadPool lPool("fragile", 1);  // one worker: the tasks after the failures need it
+    lPool.init();
+    lPool.submit([] { throw QNCInvalidEx("bad sample", 6); });
+    lPool.submit([] { throw std::runtime_error("bad reading"); });
+    lPool.submit([] { throw 7; });
+    lPool.submit([&] { ++lAfter; });
+    lPool.finish();
+    lPool.waitForThreads();
+  }
+  flushLogger();
+  const std::string lText = qntest::readFile(lLog);
+  destroyLogger();
+  EXPECT_EQ(1, lAfter);
+  EXPECT_NE(std::string::npos, lText.find("-E-")) << lText;
+  EXPECT_NE(std::string::npos, lText.find("ThreadPool 'fragile': task failed: bad sample")) << lText;
+  EXPECT_NE(std::string::npos, lText.find("ThreadPool 'fragile': task failed: bad reading")) << lText;
+  EXPECT_NE(std::string::npos, lText.find("ThreadPool 'fragile': task failed: unknown exception")) << lText;
+}
+
+TEST(ThreadPoolTest, MisuseIsRefusedWithClearErrors) {
+  try {
+    QNCThreadPool lEmpty("none", 0);
+    FAIL() << "a pool without threads must be refused";
+  } catch (const QNCInvalidEx& acrException) {
+    EXPECT_STREQ("ThreadPool 'none' needs at least one thread", acrException.what());
+  }
+  QNCThreadPool lPool("twice", 1);
+  EXPECT_THROW(lPool.submit(QNCThreadPool::QNTTask()), QNCInvalidEx);
+  lPool.waitForThreads();  // never started: returns at once
+  lPool.init();
+  EXPECT_THROW(lPool.init(), QNCInvalidEx);
+  lPool.finish();
+  lPool.finish();  // idempotent
+  lPool.waitForThreads();
+  lPool.waitForThreads();  // already joined
+  EXPECT_STREQ("twice", lPool.getName().get());
+}
+
+// Fault pinned: the owner joins (holding the join lock) while a task of the pool asks to wait for
+// the pool too; the task blocked on that lock and the join never finished.
+TEST(ThreadPoolTest, AWorkerWaitingForItsOwnPoolIsRefused) {
+  std::atomic<int> lRefused{0};
+  QNCThreadPool lPool("self", 1);
+  lPool.init();
+  lPool.submit([&] {
+    try {
+      lPool.waitForThreads();
+    } catch (const QNCInvalidEx&) {
+      ++lRefused;
+    }
+  });
+  lPool.finish();
+  lPool.waitForThreads();
+  EXPECT_EQ(1, lRefused);
+}
+
+// Destroying a started pool that was never finished must neither terminate the process (joinable
+// threads destroyed) nor drop the queued work.
+TEST(ThreadPoolTest, DestructorFinishesDrainsAndJoins) {
+  Gate lGate;
+  std::atomic<int> lDone{0};
+  {
+    QNCThreadPool lPool("abandoned", 2);
+    lPool.init();
+    lPool.submit([&] {
+      lGate.pass();
+      ++lDone;
+    });
+    for (int lIndex = 0; lIndex < 10; ++lIndex) lPool.submit([&] { ++lDone; });
+    lGate.open();
+  }
+  EXPECT_EQ(11, lDone);
+}
+
+}  // namespace
