@@ -9,11 +9,13 @@
 namespace qnbench {
 
 void startSecondThread() {
-  static std::mutex sLock;
-  static std::condition_variable sNever;
-  std::thread([] {
-    std::unique_lock<std::mutex> lGuard(sLock);
-    sNever.wait(lGuard, [] { return false; });
+  // Never destroyed: a condition variable destroyed at exit while the idle thread still waits on
+  // it blocks the exit.
+  auto* lpLock = new std::mutex;
+  auto* lpNever = new std::condition_variable;
+  std::thread([lpLock, lpNever] {
+    std::unique_lock<std::mutex> lGuard(*lpLock);
+    lpNever->wait(lGuard, [] { return false; });
   }).detach();
 }
 

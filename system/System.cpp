@@ -80,6 +80,11 @@ void QNCSystem::init() {
   QN_LOG_TRACE("Setting the IP Address");
   mAddress = QNCPointer<QNCIpAddress>(new (std::nothrow) QNCIpAddress(lAddress), QNPST_Individual, QNPAT_New);
   QN_LOG_NOTICE("IpAddress: %s", mAddress->getStringForm());
+  QN_LOG_TRACE("Creating Numeric Id Manager...");
+  mNumericIdManager = QNCPointer<QNCNumericIdManager>(new (std::nothrow) QNCNumericIdManager, QNPST_Individual, QNPAT_New);
+  QN_LOG_TRACE("Creating NID creation lock...");
+  mNidCreationLock = QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex, QNPST_Individual, QNPAT_New);
+  mProtocolHelper = QNCPointer<QNCProtocolHelper>(new (std::nothrow) QNCProtocolHelper(100), QNPST_Individual, QNPAT_New);
   QN_LEFT();
 }
 

@@ -1,9 +1,21 @@
 #include "BufferManager.h"
-#include "QNException.h"
+#include "Logger.h"
 #include "System.h"
 
-void QNCSystem::getBuffer(unsigned int, QNCPointer<QNCBuffer>&) {
-  throw QNCNotImplementedEx("getBuffer: no buffer manager", 0);
+void QNCSystem::getBuffer(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer) {
+  QN_ENTERED();
+  mBufferManager->get(aLength, arBuffer);
+  QN_LEFT();
 }
-void QNCSystem::reuseBuffer(QNCPointer<QNCBuffer>&) {}
-void QNCSystem::clearBuffer(QNCPointer<QNCBuffer>&) {}
+
+void QNCSystem::reuseBuffer(QNCPointer<QNCBuffer>& arBuffer) {
+  QN_ENTERED();
+  mBufferManager->reuse(arBuffer);
+  QN_LEFT();
+}
+
+void QNCSystem::clearBuffer(QNCPointer<QNCBuffer>& arBuffer) {
+  QN_ENTERED();
+  mBufferManager->reuse(arBuffer);
+  QN_LEFT();
+}

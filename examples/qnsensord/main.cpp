@@ -14,6 +14,11 @@ int main(int argc, char** argv) {
   } catch (const QNCParentExitEx&) {
     // The parent side of daemonizing, or "-s" after stopping the running instance.
     return 0;
+  } catch (const QNCUsageEx& acrException) {
+    // Refused during the command-line step: no log file, no PID file, no thread exists yet.
+    fprintf(stderr, "qnsensord: %s\n", acrException.what());
+    QNCSensorSystem::printUsage(stderr);
+    return 2;
   } catch (const QNCException& acrException) {
     fprintf(stderr, "qnsensord: %s\n", acrException.what());
     return 1;

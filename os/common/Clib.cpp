@@ -14,27 +14,26 @@
 #include "OsError.h"
 
 namespace {
-// "fd 7", for messages about a descriptor.
-struct QNSFdText {
-  explicit QNSFdText(int aFd) { snprintf(mText, sizeof mText, "fd %d", aFd); }
-  char mText[24];
-};
-
-void sleepFor(struct timespec aRequest) {
-  // nanosleep reports the time left when a signal interrupts it; sleep on for the rest.
-  while (nanosleep(&aRequest, &aRequest) != 0 && errno == EINTR) {
+// Sleeps for the given time, to a deadline on the monotonic clock. An absolute deadline makes every signal
+// cost nothing: a relative sleep restarted with the time left loses its rounding each time.
+void sleepFor(time_t aSeconds, long aNanoseconds) {
+  struct timespec lDeadline;
+  clock_gettime(CLOCK_MONOTONIC, &lDeadline);  // cannot fail: the clock exists
+  lDeadline.tv_sec += aSeconds + (lDeadline.tv_nsec + aNanoseconds) / 1000000000L;
+  lDeadline.tv_nsec = (lDeadline.tv_nsec + aNanoseconds) % 1000000000L;
+  // clock_nanosleep returns the error number; EINTR means a handler ran: sleep on.
+  while (clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &lDeadline, nullptr) == EINTR) {
   }
 }
 }  // namespace
 
 int ClibOpen(const char* apPath, int aFlags, int aMode) {
   for (;;) {
-    const int lFd = open(apPath, aFlags, aMode);
+    const int lFd = open(apPath, aFlags, static_cast<mode_t>(aMode));
     if (lFd >= 0) return lFd;
-    if (errno == EINTR) continue;  // open of a FIFO or slow device can be interrupted
-    char lQuoted[QNCException::kMaxMessage / 2];
-    snprintf(lQuoted, sizeof lQuoted, "'%s'", apPath);
-    OsThrowError<QNCOpenFailedEx>(errno, "open", lQuoted);
+    const int lErrno = errno;
+    if (lErrno == EINTR) continue;  // open of a FIFO or slow device can be interrupted; nothing was opened
+    OsThrowPathError<QNCOpenFailedEx>(lErrno, "open", apPath);
   }
 }
 
@@ -42,8 +41,9 @@ unsigned int ClibRead(int aFd, void* apBuffer, unsigned int aCount) {
   for (;;) {
     const ssize_t lRead = read(aFd, apBuffer, aCount);
     if (lRead >= 0) return static_cast<unsigned int>(lRead);
-    if (errno == EINTR) continue;  // nothing was read; the call can be made again
-    OsThrowError<QNCReadFailedEx>(errno, "read", QNSFdText(aFd).mText);
+    const int lErrno = errno;
+    if (lErrno == EINTR) continue;  // interrupted before anything was read: the call can be made again
+    OsThrowFdError<QNCReadFailedEx>(lErrno, "read", aFd);
   }
 }
 
@@ -53,12 +53,13 @@ unsigned int ClibWrite(int aFd, const void* apBuffer, unsigned int aCount) {
   while (lWritten < aCount) {
     const ssize_t lResult = write(aFd, lpBytes + lWritten, aCount - lWritten);
     if (lResult > 0) {
+      // A signal during a blocked write ends it early with the bytes written so far: go on.
       lWritten += static_cast<unsigned int>(lResult);
-    } else if (lResult < 0 && errno == EINTR) {
-      continue;  // interrupted before anything was written
-    } else {
-      OsThrowError<QNCWriteFailedEx>(lResult == 0 ? EIO : errno, "write", QNSFdText(aFd).mText);
+      continue;
     }
+    const int lErrno = lResult < 0 ? errno : EIO;  // 0 bytes for a non-zero count: no progress possible
+    if (lErrno == EINTR) continue;                 // interrupted before anything was written
+    OsThrowFdError<QNCWriteFailedEx>(lErrno, "write", aFd);
   }
   return lWritten;
 }
@@ -66,59 +67,69 @@ unsigned int ClibWrite(int aFd, const void* apBuffer, unsigned int aCount) {
 void ClibClose(int aFd) {
   // Never retried: Linux releases the descriptor even when close reports EINTR, and a retry could
   // close a descriptor another thread has just been given.
-  if (close(aFd) != 0 && errno != EINTR) OsThrowError<QNCCloseFailedEx>(errno, "close", QNSFdText(aFd).mText);
+  if (close(aFd) == 0) return;
+  const int lErrno = errno;
+  if (lErrno != EINTR) OsThrowFdError<QNCCloseFailedEx>(lErrno, "close", aFd);
 }
 
 void ClibStat(const char* apPath, struct stat* apOut) {
-  if (stat(apPath, apOut) != 0) {
-    char lQuoted[QNCException::kMaxMessage / 2];
-    snprintf(lQuoted, sizeof lQuoted, "'%s'", apPath);
-    OsThrowError<QNCClibStatFailedEx>(errno, "stat", lQuoted);
+  for (;;) {
+    if (stat(apPath, apOut) == 0) return;
+    const int lErrno = errno;
+    if (lErrno == EINTR) continue;  // possible on network file systems; stat has no effect to repeat
+    OsThrowPathError<QNCClibStatFailedEx>(lErrno, "stat", apPath);
   }
 }
 
 int ClibGetpid() { return static_cast<int>(getpid()); }
 
 int ClibGetProcStatus(int aPid) {
-  char lText[24];
-  snprintf(lText, sizeof lText, "pid %d", aPid);
-  // kill(0, ...) and kill(-n, ...) address process groups, not one process.
-  if (aPid <= 0) OsThrowError<QNCClibGetProcStatusFailedEx>(ESRCH, "kill(0)", lText);
+  char lPid[24];
+  snprintf(lPid, sizeof lPid, "pid %d", aPid);
+  // kill(0, …) and kill(-n, …) address process groups, kill(-1, …) every process: never probe them.
+  if (aPid <= 0) OsThrowError<QNCClibGetProcStatusFailedEx>(EINVAL, "kill(signal 0)", lPid);
   if (kill(aPid, 0) == 0) return 0;
-  // EPERM: the process exists but belongs to another user.
-  if (errno == EPERM) return 0;
-  OsThrowError<QNCClibGetProcStatusFailedEx>(errno, "kill(0)", lText);
+  const int lErrno = errno;
+  if (lErrno == EPERM) return 0;  // the process exists but belongs to another user
+  OsThrowError<QNCClibGetProcStatusFailedEx>(lErrno, "kill(signal 0)", lPid);
 }
 
-void ClibSleep(unsigned int aSeconds) { sleepFor({static_cast<time_t>(aSeconds), 0}); }
+void ClibSleep(unsigned int aSeconds) { sleepFor(static_cast<time_t>(aSeconds), 0); }
 
 void ClibSleepMS(unsigned long aMilliseconds) {
-  sleepFor({static_cast<time_t>(aMilliseconds / 1000), static_cast<long>(aMilliseconds % 1000) * 1000000L});
+  sleepFor(static_cast<time_t>(aMilliseconds / 1000), static_cast<long>(aMilliseconds % 1000) * 1000000L);
 }
 
 void ClibChdir(const char* apDir) {
-  if (chdir(apDir) != 0) {
-    char lQuoted[QNCException::kMaxMessage / 2];
-    snprintf(lQuoted, sizeof lQuoted, "'%s'", apDir);
-    OsThrowError<QNCOpenFailedEx>(errno, "chdir", lQuoted);
+  for (;;) {
+    if (chdir(apDir) == 0) return;
+    const int lErrno = errno;
+    if (lErrno == EINTR) continue;  // possible on network file systems; nothing changed yet
+    OsThrowPathError<QNCOpenFailedEx>(lErrno, "chdir", apDir);
   }
 }
 
 void ClibStrerror(char* apBuffer, unsigned long aSize) {
   if (aSize == 0) return;
   const int lErrno = errno;
+  // The GNU strerror_r returns the text, which may or may not be apBuffer.
   const char* lpText = strerror_r(lErrno, apBuffer, aSize);
   if (lpText != apBuffer) snprintf(apBuffer, aSize, "%s", lpText);
+  errno = lErrno;  // the caller may still want the number it asked about
 }
 
 void ClibGethostname(char* apBuffer, unsigned int aSize) {
   if (aSize == 0) return;
-  if (gethostname(apBuffer, aSize) != 0) snprintf(apBuffer, aSize, "%s", "localhost");
+  if (gethostname(apBuffer, aSize) != 0) {
+    // ENAMETOOLONG: glibc has already copied what fits, unterminated; any other failure leaves
+    // nothing usable.
+    if (errno != ENAMETOOLONG) snprintf(apBuffer, aSize, "%s", "localhost");
+  }
   apBuffer[aSize - 1] = '\0';  // gethostname does not terminate a cut name
 }
 
 void ClibMemcpy(void* apDestination, const void* apSource, unsigned long aCount) {
-  if (aCount != 0) memcpy(apDestination, apSource, aCount);
+  if (aCount != 0) memcpy(apDestination, apSource, aCount);  // a count of 0 may come with null pointers
 }
 
 int ClibStrcmp(const char* apFirst, const char* apSecond) { return strcmp(apFirst, apSecond); }

@@ -5,13 +5,22 @@
 #include <signal.h>
 #include <sys/utsname.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <cstring>
 
 #include "Os.h"
 #include "QNString.h"
 
-int OsKill(int aPid, int aSignal) { return kill(aPid, aSignal); }
+int OsKill(int aPid, int aSignal) {
+  // kill(0, …) signals the caller's whole process group and kill(-1, …) every process it may
+  // signal: a pid of 0 or below (a PID file with bad contents) must never get that far.
+  if (aPid <= 0) {
+    errno = EINVAL;
+    return -1;
+  }
+  return kill(aPid, aSignal);
+}
 
 void OsGetOsName(QNEOperatingSystem& arOs, QNCString& arVariant) {
   struct utsname lName;
@@ -21,8 +30,8 @@ void OsGetOsName(QNEOperatingSystem& arOs, QNCString& arVariant) {
     return;
   }
   arOs = strcmp(lName.sysname, "Linux") == 0 ? QNOS_Linux : QNOS_OtherUnix;
-  char lVariant[sizeof lName.sysname + sizeof lName.release + 2];
-  snprintf(lVariant, sizeof lVariant, "%s %s", lName.sysname, lName.release);
+  char lVariant[sizeof lName.sysname + sizeof lName.release + sizeof lName.machine + 3];
+  snprintf(lVariant, sizeof lVariant, "%s %s %s", lName.sysname, lName.release, lName.machine);
   arVariant = QNCString(lVariant);
 }
 
@@ -33,8 +42,10 @@ void OsGetIpAddress(unsigned int& arAddress) {
   for (struct ifaddrs* lpEntry = lpList; lpEntry != nullptr; lpEntry = lpEntry->ifa_next) {
     if (lpEntry->ifa_addr == nullptr || lpEntry->ifa_addr->sa_family != AF_INET) continue;
     if ((lpEntry->ifa_flags & IFF_LOOPBACK) != 0 || (lpEntry->ifa_flags & IFF_UP) == 0) continue;
-    const auto* lpAddress = reinterpret_cast<const struct sockaddr_in*>(lpEntry->ifa_addr);
-    arAddress = ntohl(lpAddress->sin_addr.s_addr);
+    sockaddr_in lAddress;
+    // Copied, not cast: the list holds a sockaddr, whose alignment need not suit sockaddr_in.
+    memcpy(&lAddress, lpEntry->ifa_addr, sizeof lAddress);
+    arAddress = ntohl(lAddress.sin_addr.s_addr);
     break;
   }
   freeifaddrs(lpList);

@@ -1,29 +1,34 @@
 #pragma once
-// QNCMutex: an ordinary, non-recursive mutex. A thread that locks it twice without unlocking
-// blocks itself. The destructor never throws: a failure to destroy the mutex is traced
-// "Ignoring exception in Mutex destruction ..." and ignored.
+// QNCMutex: the lock every part of the system uses. An ordinary, non-recursive mutex: a thread
+// that locks it twice without unlocking blocks itself, and only the holder may unlock it.
+// Any thread may lock and unlock it; the object itself must outlive every thread that uses it.
 
 #include <pthread.h>
 
 class QNCMutex {
  public:
+  // Throws QNCOsException when the system cannot create the mutex.
   QNCMutex();
   QNCMutex(const QNCMutex&) = delete;
   QNCMutex& operator=(const QNCMutex&) = delete;
+  // Traces "Entered" and "Left". Never throws: when the system refuses to destroy the mutex (it is
+  // still locked, EBUSY) the failure is traced "Ignoring exception in Mutex destruction ..." and
+  // the destructor ends normally.
   virtual ~QNCMutex();
 
-  // Blocks until the calling thread holds the mutex.
+  // Blocks, as long as necessary, until the calling thread holds the mutex.
   void lock();
+  // The calling thread must hold the mutex.
   void unlock();
 
-  // The system mutex, for QNCConditional.
+  // The system mutex, for QNCConditional to wait with.
   pthread_mutex_t& getMutex() { return mMutex; }
 
  private:
   pthread_mutex_t mMutex;
 };
 
-// Holds a QNCMutex for one scope; the lock is released on every way out.
+// Holds a QNCMutex for one scope; the lock is released on every way out, exceptions included.
 class QNCMutexLocker {
  public:
   explicit QNCMutexLocker(QNCMutex& arMutex) : mMutex(arMutex) { mMutex.lock(); }

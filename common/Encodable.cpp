@@ -1,0 +1,3 @@
+#include "Encodable.h"
+
+QNCEncodable::~QNCEncodable() = default;

@@ -1,0 +1,156 @@
+#include "ProtocolHelper.h"
+
+#include <new>
+
+#include "AllocatedBuffer.h"
+#include "Clib.h"
+#include "LocalBuffer.h"
+#include "Logger.h"
+#include "QNException.h"
+#include "Reader.h"
+#include "Writer.h"
+
+namespace {
+constexpr unsigned int kMaxAttempts = 301;
+constexpr unsigned int kReadFailedCode = 328;
+
+QNCPointer<QNCBuffer> newBuffer(unsigned int acLength) {
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(acLength, 0), QNPST_Individual, QNPAT_New);
+}
+}  // namespace
+
+QNCProtocolHelper::QNCProtocolHelper(unsigned int acRetrySleepTime, unsigned int aMaxMessageSize)
+    : mRetrySleepTime(acRetrySleepTime), mMaxMessageSize(aMaxMessageSize) {
+  QN_ENTERED();
+  QN_LEFT();
+}
+
+QNCProtocolHelper::~QNCProtocolHelper() {
+  QN_ENTERED();
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer,
+                             unsigned int acSize) {
+  QN_ENTERED();
+  unsigned int lreadsize = acSize;
+  if (lreadsize == 0) __readSize(arReader, lreadsize);
+  if (mMaxMessageSize != 0 && lreadsize > mMaxMessageSize) {
+    QN_LOG_ERROR("Message of %u bytes exceeds the maximum of %u", lreadsize, mMaxMessageSize);
+    throw QNCReadFailedEx("Message exceeds the maximum size", kReadFailedCode);
+  }
+  QN_LOG_TRACE("Creating a buffer of '%u' size for receiving", lreadsize);
+  if (lreadsize == 0) {
+    // An empty message: a buffer cannot be made with a used length of 0, so make room for one
+    // byte and use none of it.
+    QNCPointer<QNCBuffer> lEmpty = newBuffer(1);
+    lEmpty->setLength(0);
+    arBuffer = lEmpty;
+    QN_LEFT();
+    return;
+  }
+  QNCPointer<QNCBuffer> lMessage = newBuffer(lreadsize);
+  __gather(arReader, lMessage, lreadsize);
+  arBuffer = lMessage;
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer,
+                              bool acWithoutSize) {
+  QN_ENTERED();
+  if (!acWithoutSize) __writeSize(arWriter, acrBuffer->getLength());
+  __writeActual(arWriter, acrBuffer);
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::__readSize(QNCPointer<QNCReader>& arReader, unsigned int& arSize) {
+  QN_ENTERED();
+  QNCPointer<QNCBuffer> lPrefix = newBuffer(sizeof arSize);
+  __gather(arReader, lPrefix, sizeof arSize);
+  const QNCBuffer& lBytes = *lPrefix;
+  ClibMemcpy(&arSize, static_cast<const unsigned char*>(lBytes), sizeof arSize);
+  QN_LOG_TRACE("Protocol Message to read is of '%u' bytes", arSize);
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::__gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arTarget,
+                                 unsigned int acTotal) {
+  // The first read goes straight into the target; a chunk buffer is made only when a read comes
+  // up short, and its bytes are copied into place. Every read is offered exactly the missing
+  // length either way.
+  unsigned char* lpTarget = *arTarget;
+  QNCPointer<QNCBuffer> lChunk = arTarget;
+  unsigned int lReadbynow = 0;
+  unsigned int lcountsize = 0;
+  while (acTotal > lReadbynow) {
+    const unsigned int lMissing = acTotal - lReadbynow;
+    if (lReadbynow != 0 && (lChunk.get() == arTarget.get() || lChunk->getCapacity() < lMissing)) {
+      lChunk = newBuffer(lMissing);
+    }
+    lChunk->setLength(lMissing);
+    QNCBuffer* const lpOffered = lChunk.get();
+    __readActual(arReader, lcountsize, lChunk);
+    QN_LOG_TRACE("lReadbynow = %u, lcountsize = %u lreadsize = %u", lReadbynow, lcountsize, acTotal);
+    if (lcountsize == 0 || lcountsize > lMissing) {
+      QN_LOG_ERROR("Failed in reading %u read %u", acTotal, lReadbynow);
+      throw QNCReadFailedEx("Failed in reading the chunk", kReadFailedCode);
+    }
+    // Bytes that did not land in place -- read into a chunk, or into a buffer of the reader's
+    // own that it put into the pointer -- are copied there.
+    const QNCBuffer& lDelivered = *lChunk;
+    const unsigned char* lpDelivered = lDelivered;
+    if (lpDelivered != lpTarget + lReadbynow || lChunk.get() != lpOffered) {
+      ClibMemcpy(lpTarget + lReadbynow, lpDelivered, lcountsize);
+    }
+    lReadbynow += lcountsize;
+    QN_LOG_TRACE("Read %u bytes into localbuffer total read = %u", lcountsize, lReadbynow);
+    lcountsize = 0;
+  }
+  arTarget->setLength(acTotal);
+}
+
+void QNCProtocolHelper::__readActual(QNCPointer<QNCReader>& arReader, unsigned int& arCount,
+                                     QNCPointer<QNCBuffer>& arBuffer) {
+  QN_ENTERED();
+  unsigned int lCount = 0;
+  __read(arReader, arBuffer, lCount);
+  arCount = lCount;
+  QN_LOG_TRACE("Read '%u' bytes of Protocol Message (actual bytes - '%u')", arCount, arBuffer->getLength());
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::__read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer,
+                               unsigned int& arCount) {
+  QN_ENTERED();
+  for (unsigned int lAttempt = 0; lAttempt < kMaxAttempts; ++lAttempt) {
+    try {
+      arReader->read(arBuffer, arCount);
+      break;
+    } catch (QNCTryAgainEx&) {
+      QN_LOG_TRACE("Resource temporarily unavailable... Sleeping");
+      if (mRetrySleepTime != 0) ClibSleepMS(mRetrySleepTime);
+    }
+  }
+  QN_LOG_TRACE("Read '%u' bytes", arCount);
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::__writeSize(QNCPointer<QNCWriter>& arWriter, unsigned int aSize) {
+  QN_ENTERED();
+  unsigned int lCount = 0;
+  QNCPointer<QNCBuffer> lPrefix(
+      new (std::nothrow) QNCLocalBuffer(reinterpret_cast<const unsigned char*>(&aSize), sizeof aSize),
+      QNPST_Individual, QNPAT_New);
+  arWriter->write(lPrefix, lCount);
+  QN_LOG_TRACE("Wrote '%u' bytes of Protocol Message Size of required '%u'", lCount,
+               static_cast<unsigned int>(sizeof aSize));
+  QN_LEFT();
+}
+
+void QNCProtocolHelper::__writeActual(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer) {
+  QN_ENTERED();
+  unsigned int lCount = 0;
+  arWriter->write(acrBuffer, lCount);
+  QN_LOG_TRACE("Wrote '%u' bytes of Protocol Message of required '%u'", lCount, acrBuffer->getLength());
+  QN_LEFT();
+}

@@ -1,0 +1,339 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstring>
+#include <initializer_list>
+#include <memory>
+#include <mutex>
+#include <new>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "AllocatedBuffer.h"
+#include "BufferManager.h"
+#include "Logger.h"
+#include "Pointer.h"
+#include "QNException.h"
+#include "QNString.h"
+#include "System.h"
+#include "TestSupport.h"
+
+namespace {
+
+// A system object that only supplies the bucket list (and, on request, its manager).
+class BucketSystem : public QNCSystem {
+ public:
+  explicit BucketSystem(std::initializer_list<unsigned int> aLengths) {
+    for (const unsigned int lLength : aLengths) mMemoryBufferList.pushBack(lLength);
+  }
+  void installManager() {
+    mBufferManager = QNCPointer<QNCBufferManager>(new (std::nothrow) QNCBufferManager(this), QNPST_Individual,
+                                                  QNPAT_New);
+  }
+  void setCommandLineArgumentDesc() override {}
+  void parseConfigFile(QNCString&) override { throw QNCNotImplementedEx("no configuration file", 0); }
+  void displayHelp() override {}
+};
+
+std::unique_ptr<QNCBufferManager> makeManager(std::initializer_list<unsigned int> aLengths) {
+  BucketSystem lSystem(aLengths);
+  return std::make_unique<QNCBufferManager>(&lSystem);
+}
+
+QNCPointer<QNCBuffer> take(QNCBufferManager& arManager, unsigned int aLength) {
+  QNCPointer<QNCBuffer> lBuffer;
+  arManager.get(aLength, lBuffer);
+  return lBuffer;
+}
+
+// Every test writes its own log, so that its lines can be checked.
+class BufferManagerTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    setLogCode(255);
+    CreateLogger(QNCString(mDir.file("pool.log").c_str()));
+  }
+  void TearDown() override { destroyLogger(); }
+
+  // The lines of the log so far that contain acrText.
+  std::vector<std::string> linesWith(const std::string& acrText) {
+    flushLogger();
+    std::vector<std::string> lLines;
+    const std::string lLog = qntest::readFile(mDir.file("pool.log"));
+    size_t lStart = 0;
+    while (lStart < lLog.size()) {
+      size_t lEnd = lLog.find('\n', lStart);
+      if (lEnd == std::string::npos) lEnd = lLog.size();
+      const std::string lLine = lLog.substr(lStart, lEnd - lStart);
+      if (lLine.find(acrText) != std::string::npos) lLines.push_back(lLine);
+      lStart = lEnd + 1;
+    }
+    return lLines;
+  }
+
+  qntest::TempDir mDir;
+};
+
+// The bucket is visible as the capacity of a new buffer: the manager makes it with the bucket's
+// length as its maximum.
+TEST_F(BufferManagerTest, AscendingListGivesTheSmallestFittingBucket) {
+  auto lAscending = makeManager({64, 256, 1024});
+  EXPECT_EQ(64u, take(*lAscending, 1)->getCapacity());
+  EXPECT_EQ(64u, take(*lAscending, 64)->getCapacity());
+  EXPECT_EQ(256u, take(*lAscending, 65)->getCapacity());
+  EXPECT_EQ(1024u, take(*lAscending, 1024)->getCapacity());
+}
+
+TEST_F(BufferManagerTest, LaterBucketsThatFirstFitShadowsAreNeverUsed) {
+  // Unsorted: bucket 0 already fits everything up to 256, so bucket 1 is never chosen.
+  auto lUnsorted = makeManager({256, 64});
+  EXPECT_EQ(256u, take(*lUnsorted, 10)->getCapacity());
+  EXPECT_EQ(256u, take(*lUnsorted, 64)->getCapacity());
+  EXPECT_EQ(256u, take(*lUnsorted, 256)->getCapacity());
+  EXPECT_TRUE(linesWith("Determined bucket number is 1").empty());
+
+  // Duplicates: the later of two equal buckets is never chosen, on either side.
+  auto lDuplicate = makeManager({128, 128});
+  QNCPointer<QNCBuffer> lBuffer = take(*lDuplicate, 100);
+  lDuplicate->reuse(lBuffer);
+  take(*lDuplicate, 128);
+  EXPECT_FALSE(linesWith("Determined bucket number is 0").empty());
+  EXPECT_TRUE(linesWith("Determined bucket number is 1").empty());
+  EXPECT_TRUE(linesWith("bucket # 1").empty());
+}
+
+TEST_F(BufferManagerTest, ReusedBufferComesBackWithItsOldBytesAndTheNewLength) {
+  auto lManager = makeManager({64, 256});
+  QNCPointer<QNCBuffer> lFirst = take(*lManager, 100);
+  EXPECT_EQ(100u, lFirst->getLength());
+  EXPECT_EQ(256u, lFirst->getCapacity());
+  memcpy(static_cast<unsigned char*>(*lFirst), "previous user", 13);
+  QNCBuffer* const lObject = lFirst.get();
+
+  lManager->reuse(lFirst);
+  EXPECT_EQ(lObject, lFirst.get());  // reuse leaves the caller's pointer alone
+  EXPECT_EQ(100u, lFirst->getLength());
+
+  QNCPointer<QNCBuffer> lSecond = take(*lManager, 200);
+  EXPECT_EQ(lObject, lSecond.get());
+  EXPECT_EQ(200u, lSecond->getLength());
+  EXPECT_EQ(0, memcmp("previous user", static_cast<const unsigned char*>(*lSecond), 13));
+  EXPECT_EQ(1u, linesWith("No existing buffers.. creating new of 256 size").size());
+  EXPECT_EQ(1u, linesWith("Got buffer of 256 length from bucket # 1").size());
+}
+
+TEST_F(BufferManagerTest, GetReplacesWhatTheCallersPointerHeld) {
+  auto lManager = makeManager({64});
+  QNCPointer<QNCBuffer> lBuffer = take(*lManager, 8);
+  QNCPointer<QNCBuffer> lWatch = lBuffer;
+  lManager->get(8, lBuffer);
+  EXPECT_NE(lWatch.get(), lBuffer.get());
+  EXPECT_EQ(8u, lWatch->getLength());
+}
+
+TEST_F(BufferManagerTest, IdleBuffersComeBackFirstInFirstOut) {
+  auto lManager = makeManager({64});
+  QNCPointer<QNCBuffer> lA = take(*lManager, 10);
+  QNCPointer<QNCBuffer> lB = take(*lManager, 10);
+  QNCPointer<QNCBuffer> lC = take(*lManager, 10);
+  lManager->reuse(lB);
+  lManager->reuse(lC);
+  lManager->reuse(lA);
+  EXPECT_EQ(lB.get(), take(*lManager, 1).get());
+  EXPECT_EQ(lC.get(), take(*lManager, 1).get());
+  EXPECT_EQ(lA.get(), take(*lManager, 1).get());
+  // The queue is empty again: the next buffer is new.
+  const QNCPointer<QNCBuffer> lNew = take(*lManager, 1);
+  EXPECT_TRUE(lNew.get() != lA.get() && lNew.get() != lB.get() && lNew.get() != lC.get());
+}
+
+TEST_F(BufferManagerTest, ReturnedBufferIsSortedByItsUsedLengthNotItsOrigin) {
+  auto lManager = makeManager({64, 256});
+  QNCPointer<QNCBuffer> lBuffer = take(*lManager, 200);
+  lBuffer->setLength(10);
+  lManager->reuse(lBuffer);
+  EXPECT_EQ(1u, linesWith("Queuing buffer to be reused in bucket # 0").size());
+
+  const QNCPointer<QNCBuffer> lSmall = take(*lManager, 50);
+  EXPECT_EQ(lBuffer.get(), lSmall.get());
+  EXPECT_EQ(256u, lSmall->getCapacity());
+  EXPECT_EQ(50u, lSmall->getLength());
+  // Bucket 1 lost it: a request there makes a new buffer.
+  EXPECT_NE(lBuffer.get(), take(*lManager, 200).get());
+}
+
+TEST_F(BufferManagerTest, UsedLengthAbove4096IsNeverPooled) {
+  auto lManager = makeManager({64, 8192});
+  // get has no such limit: a bucket of 8192 serves 5000.
+  QNCPointer<QNCBuffer> lLarge = take(*lManager, 5000);
+  EXPECT_EQ(8192u, lLarge->getCapacity());
+  lLarge->setLength(4097);
+  lManager->reuse(lLarge);
+  EXPECT_EQ(1u, linesWith("Buffer too big... Need not be reused").size());
+  EXPECT_TRUE(linesWith("Queuing buffer").empty());
+  EXPECT_NE(lLarge.get(), take(*lManager, 4097).get());
+
+  // At exactly 4096 it is pooled.
+  lLarge->setLength(4096);
+  lManager->reuse(lLarge);
+  EXPECT_EQ(lLarge.get(), take(*lManager, 4096).get());
+}
+
+TEST_F(BufferManagerTest, ReuseWithoutAFittingBucketLogsTwoErrorsAndReturns) {
+  auto lManager = makeManager({64, 1024});
+  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow) QNCAllocatedBuffer(4096, 0), QNPST_Individual, QNPAT_New);
+  EXPECT_NO_THROW(lManager->reuse(lBuffer));
+  const auto lSearch = linesWith("Failed to find a bucket for 4096 buffer size");
+  ASSERT_EQ(1u, lSearch.size());
+  EXPECT_NE(std::string::npos, lSearch[0].find("-E-"));
+  const auto lAbsorbed = linesWith("Failed to determine bucket no, error: Cannot find a buffer bucket");
+  ASSERT_EQ(1u, lAbsorbed.size());
+  EXPECT_NE(std::string::npos, lAbsorbed[0].find("-E-"));
+  EXPECT_EQ(4096u, lBuffer->getLength());
+}
+
+TEST_F(BufferManagerTest, GetWithoutAFittingBucketThrowsNoMemoryAndKeepsTheCallersBuffer) {
+  auto lManager = makeManager({64, 256, 1024});
+  QNCPointer<QNCBuffer> lBuffer = take(*lManager, 5);
+  QNCBuffer* const lBefore = lBuffer.get();
+  const size_t lLocksBefore = linesWith("Locking bucket").size();
+  try {
+    lManager->get(1025, lBuffer);
+    FAIL() << "get(1025) found a bucket";
+  } catch (const QNCNoMemoryEx& acrException) {
+    EXPECT_STREQ("Cannot find a buffer bucket", acrException.what());
+    EXPECT_EQ(2u, acrException.getCode());
+  }
+  EXPECT_EQ(lBefore, lBuffer.get());
+  const auto lErrors = linesWith("-E-");
+  ASSERT_EQ(2u, lErrors.size());
+  EXPECT_NE(std::string::npos, lErrors[0].find("Failed to find a bucket for 1025 buffer size"));
+  EXPECT_NE(std::string::npos, lErrors[1].find("Cannot allocate a buffer"));
+  EXPECT_EQ(lLocksBefore, linesWith("Locking bucket").size());  // no lock was taken
+  // The failure left no bucket locked.
+  EXPECT_EQ(1024u, take(*lManager, 1024)->getCapacity());
+}
+
+TEST_F(BufferManagerTest, ForeignBufferTooSmallForItsBucketIsNeverHandedOut) {
+  auto lManager = makeManager({64, 256});
+  // A message buffer: capacity equals its used length. 100 bytes would sort into bucket 1.
+  QNCPointer<QNCBuffer> lMessage(new (std::nothrow) QNCAllocatedBuffer(100, 0), QNPST_Individual, QNPAT_New);
+  lManager->reuse(lMessage);
+  EXPECT_TRUE(linesWith("Queuing buffer").empty());
+  const QNCPointer<QNCBuffer> lServed = take(*lManager, 256);
+  EXPECT_NE(lMessage.get(), lServed.get());
+  EXPECT_EQ(256u, lServed->getLength());
+
+  // One whose capacity reaches its bucket's length is pooled like any other.
+  QNCPointer<QNCBuffer> lExact(new (std::nothrow) QNCAllocatedBuffer(64, 0), QNPST_Individual, QNPAT_New);
+  lManager->reuse(lExact);
+  EXPECT_EQ(lExact.get(), take(*lManager, 64).get());
+}
+
+TEST_F(BufferManagerTest, DestructionReportsTheUsedLengthsOfIdleBuffers) {
+  auto lManager = makeManager({64, 256});
+  QNCPointer<QNCBuffer> lA = take(*lManager, 10);
+  QNCPointer<QNCBuffer> lB = take(*lManager, 20);
+  QNCPointer<QNCBuffer> lOut = take(*lManager, 200);  // handed out, not idle: not counted
+  lManager->reuse(lA);
+  lManager->reuse(lB);
+  lManager.reset();
+  EXPECT_EQ(1u, linesWith("Memory Used by the memory slab 64 : 30").size());
+  EXPECT_EQ(1u, linesWith("Memory Used by the memory slab 256 : 0").size());
+  EXPECT_EQ(1u, linesWith("TOTAL Memory Used : 30").size());
+  // The pool dropped its references; the caller's survive.
+  EXPECT_EQ(10u, lA->getLength());
+}
+
+TEST_F(BufferManagerTest, SystemServicesReachTheManager) {
+  BucketSystem lSystem({64, 256});
+  lSystem.installManager();
+  QNCPointer<QNCBuffer> lBuffer;
+  lSystem.getBuffer(100, lBuffer);
+  EXPECT_EQ(256u, lBuffer->getCapacity());
+  QNCBuffer* const lObject = lBuffer.get();
+  lSystem.reuseBuffer(lBuffer);
+  QNCPointer<QNCBuffer> lAgain;
+  lSystem.getBuffer(150, lAgain);
+  EXPECT_EQ(lObject, lAgain.get());
+  lSystem.clearBuffer(lAgain);  // the same operation as reuseBuffer
+  lSystem.getBuffer(30, lAgain);
+  EXPECT_NE(lObject, lAgain.get());  // 150 went back to bucket 1
+  lSystem.getBuffer(256, lAgain);
+  EXPECT_EQ(lObject, lAgain.get());
+}
+
+// Threads take and return buffers of every bucket, also lowering the used length so buffers
+// move between buckets. A buffer handed to two threads at once, or lost, must show.
+TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
+  setLogCode(255u & ~static_cast<unsigned int>(QNLL_Trace));
+  auto lManager = makeManager({64, 256, 1024});
+  constexpr unsigned int kThreads = 4;
+  constexpr unsigned int kRounds = 2000;
+  const unsigned int lLengths[] = {64, 256, 1024};
+
+  std::mutex lGuard;  // guards lOut and lSeen
+  std::set<QNCBuffer*> lOut;
+  std::vector<QNCPointer<QNCBuffer>> lSeen;  // every distinct buffer, kept alive so addresses stay unique
+  std::set<QNCBuffer*> lSeenSet;
+  std::vector<unsigned int> lFailures(kThreads, 0);
+
+  std::vector<std::thread> lThreads;
+  for (unsigned int lThread = 0; lThread < kThreads; ++lThread) {
+    lThreads.emplace_back([&, lThread] {
+      for (unsigned int lRound = 0; lRound < kRounds; ++lRound) {
+        const unsigned int lLength = lLengths[(lRound + lThread) % 3];
+        QNCPointer<QNCBuffer> lBuffer;
+        lManager->get(lLength, lBuffer);
+        {
+          std::lock_guard<std::mutex> lLock(lGuard);
+          if (!lOut.insert(lBuffer.get()).second) ++lFailures[lThread];
+          if (lSeenSet.insert(lBuffer.get()).second) lSeen.push_back(lBuffer);
+        }
+        const unsigned char lMark = static_cast<unsigned char>(lThread * 31 + lRound);
+        memset(static_cast<unsigned char*>(*lBuffer), lMark, lLength);
+        std::this_thread::yield();
+        for (unsigned int lIndex = 0; lIndex < lLength; ++lIndex)
+          if (lBuffer->byte(lIndex) != lMark) {
+            ++lFailures[lThread];
+            break;
+          }
+        if (lRound % 5 == 0) lBuffer->setLength(lLength / 2);
+        {
+          std::lock_guard<std::mutex> lLock(lGuard);
+          lOut.erase(lBuffer.get());
+        }
+        lManager->reuse(lBuffer);
+      }
+    });
+  }
+  for (std::thread& lThread : lThreads) lThread.join();
+  for (unsigned int lThread = 0; lThread < kThreads; ++lThread) EXPECT_EQ(0u, lFailures[lThread]);
+
+  // Drain every bucket until it makes a new buffer: each buffer ever seen comes back exactly once.
+  std::multiset<QNCBuffer*> lDrained;
+  for (const unsigned int lLength : lLengths) {
+    for (;;) {
+      QNCPointer<QNCBuffer> lBuffer = take(*lManager, lLength);
+      if (lSeenSet.count(lBuffer.get()) == 0) break;
+      lDrained.insert(lBuffer.get());
+    }
+  }
+  EXPECT_EQ(lSeen.size(), lDrained.size());
+  EXPECT_EQ(lSeenSet.size(), std::set<QNCBuffer*>(lDrained.begin(), lDrained.end()).size());
+  setLogCode(255);
+}
+
+using BufferManagerDeathTest = ::testing::Test;
+
+TEST(BufferManagerDeathTest, BrokenBucketSetupsAssert) {
+  EXPECT_EXIT(makeManager({}), ::testing::ExitedWithCode(1), "Assertion \\[ lBufferList.size\\(\\) > 0 \\] failed");
+  // Only a request for 0 can reach a bucket of length 0.
+  EXPECT_EXIT(take(*makeManager({0, 64}), 0), ::testing::ExitedWithCode(1), "Assertion \\[ 0 != lBufferSize \\] failed");
+  // Bucket 0 is empty, so get(0) makes a buffer of used length 0.
+  EXPECT_EXIT(take(*makeManager({64}), 0), ::testing::ExitedWithCode(1), "Assertion \\[ acUseLength != 0 \\] failed");
+}
+
+}  // namespace

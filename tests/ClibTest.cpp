@@ -1,0 +1,278 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <pthread.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/utsname.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <functional>
+#include <string>
+#include <thread>
+
+#include "Clib.h"
+#include "QNException.h"
+#include "TestSupport.h"
+
+namespace {
+
+using std::chrono::milliseconds;
+
+std::atomic<int> gsHandled{0};
+void countSignal(int) { ++gsHandled; }
+
+// Installs a no-op SIGUSR1 handler without SA_RESTART, so that a blocked call it interrupts
+// returns EINTR instead of being restarted by the kernel.
+class InterruptingSignal {
+ public:
+  InterruptingSignal() {
+    struct sigaction lAction = {};
+    lAction.sa_handler = countSignal;
+    sigemptyset(&lAction.sa_mask);
+    lAction.sa_flags = 0;
+    sigaction(SIGUSR1, &lAction, &mPrevious);
+  }
+  ~InterruptingSignal() { sigaction(SIGUSR1, &mPrevious, nullptr); }
+
+  // Runs aCall on a thread. Once that thread sleeps in the kernel, interrupts it with SIGUSR1,
+  // waits for the handler to have run, then calls aRelease (which lets the call finish) and joins.
+  // Returns whether the handler ran while the thread was blocked.
+  bool interrupt(const std::function<void()>& acrCall, const std::function<void()>& acrRelease) {
+    std::atomic<long> lTid{0};
+    std::thread lThread([&] {
+      lTid = syscall(SYS_gettid);
+      acrCall();
+    });
+    bool lInterrupted = false;
+    for (int lPoll = 0; lPoll < 1000 && !lInterrupted; ++lPoll) {
+      std::this_thread::sleep_for(milliseconds(10));
+      if (lTid != 0 && isSleeping(lTid)) {
+        const int lBefore = gsHandled;
+        pthread_kill(lThread.native_handle(), SIGUSR1);
+        for (int lWait = 0; lWait < 500 && gsHandled == lBefore; ++lWait)
+          std::this_thread::sleep_for(milliseconds(2));
+        lInterrupted = gsHandled != lBefore;
+      }
+    }
+    acrRelease();
+    lThread.join();
+    return lInterrupted;
+  }
+
+ private:
+  static bool isSleeping(long aTid) {
+    const std::string lStat = qntest::readFile("/proc/self/task/" + std::to_string(aTid) + "/stat");
+    const size_t lEnd = lStat.rfind(')');  // the state follows the command name in parentheses
+    return lEnd != std::string::npos && lStat.compare(lEnd, 3, ") S") == 0;
+  }
+
+  struct sigaction mPrevious;
+};
+
+class ClibTest : public ::testing::Test {
+ protected:
+  void SetUp() override { ASSERT_EQ(0, pipe(mPipe)); }
+  void TearDown() override {
+    close(mPipe[0]);
+    close(mPipe[1]);
+  }
+
+  qntest::TempDir mDir;
+  int mPipe[2];
+};
+
+TEST_F(ClibTest, FailuresNameTheCallTheObjectAndTheSystemText) {
+  const std::string lMissing = mDir.file("missing/x.pid");
+  try {
+    ClibOpen(lMissing.c_str(), O_RDONLY, 0);
+    ADD_FAILURE() << "opened a missing file";
+  } catch (QNCOpenFailedEx& arFailure) {
+    EXPECT_EQ("open '" + lMissing + "': No such file or directory", std::string(arFailure.what()));
+    EXPECT_EQ(static_cast<unsigned int>(ENOENT), arFailure.getCode());
+  }
+
+  struct stat lStat;
+  try {
+    ClibStat(lMissing.c_str(), &lStat);
+    ADD_FAILURE() << "stat of a missing file";
+  } catch (QNCClibStatFailedEx& arFailure) {
+    EXPECT_EQ("stat '" + lMissing + "': No such file or directory", std::string(arFailure.what()));
+  }
+
+  const std::string lFile = mDir.file("log");
+  const int lWriteOnly = ClibOpen(lFile.c_str(), O_WRONLY | O_CREAT, 0600);
+  char lByte;
+  try {
+    ClibRead(lWriteOnly, &lByte, 1);
+    ADD_FAILURE() << "read from a write-only descriptor";
+  } catch (QNCReadFailedEx& arFailure) {
+    EXPECT_EQ("read fd " + std::to_string(lWriteOnly) + " '" + lFile + "': Bad file descriptor",
+              std::string(arFailure.what()));
+  }
+  ClibClose(lWriteOnly);
+  try {
+    ClibClose(lWriteOnly);
+    ADD_FAILURE() << "closed a descriptor twice";
+  } catch (QNCCloseFailedEx& arFailure) {
+    EXPECT_EQ("close fd " + std::to_string(lWriteOnly) + ": Bad file descriptor",
+              std::string(arFailure.what()));
+  }
+  EXPECT_THROW(ClibChdir(lMissing.c_str()), QNCOpenFailedEx);
+}
+
+TEST_F(ClibTest, WriteToAPipeNobodyReadsReportsBrokenPipe) {
+  struct sigaction lIgnore = {};
+  struct sigaction lPrevious;
+  lIgnore.sa_handler = SIG_IGN;
+  sigaction(SIGPIPE, &lIgnore, &lPrevious);
+  close(mPipe[0]);
+  mPipe[0] = -1;
+  try {
+    ClibWrite(mPipe[1], "x", 1);
+    ADD_FAILURE() << "wrote to a pipe without a reader";
+  } catch (QNCWriteFailedEx& arFailure) {
+    EXPECT_EQ(static_cast<unsigned int>(EPIPE), arFailure.getCode());
+    EXPECT_NE(nullptr, strstr(arFailure.what(), ": Broken pipe")) << arFailure.what();
+  }
+  sigaction(SIGPIPE, &lPrevious, nullptr);
+}
+
+TEST_F(ClibTest, ReadAndWriteCarryEveryByteThroughAPipe) {
+  std::string lSent(300000, '\0');  // several times the pipe's capacity: writes block and split
+  for (size_t lIndex = 0; lIndex < lSent.size(); ++lIndex)
+    lSent[lIndex] = static_cast<char>(lIndex * 7 + lIndex / 251);
+  unsigned int lWritten = 0;
+  std::thread lWriter([&] {
+    lWritten = ClibWrite(mPipe[1], lSent.data(), static_cast<unsigned int>(lSent.size()));
+    close(mPipe[1]);
+    mPipe[1] = -1;
+  });
+  std::string lReceived;
+  char lChunk[7000];
+  for (unsigned int lRead; (lRead = ClibRead(mPipe[0], lChunk, sizeof lChunk)) > 0;)
+    lReceived.append(lChunk, lRead);
+  lWriter.join();
+  EXPECT_EQ(lSent.size(), lWritten);
+  EXPECT_TRUE(lSent == lReceived) << "received " << lReceived.size() << " bytes, not the ones sent";
+}
+
+// A signal whose handler has no SA_RESTART makes a blocked read return EINTR; the raw call shows
+// that the set-up does interrupt it, the wrapper must read on and return the data.
+TEST_F(ClibTest, SignalDuringABlockedReadIsNotAFailure) {
+  InterruptingSignal lSignal;
+  char lByte = 0;
+  ssize_t lRawResult = 0;
+  int lRawErrno = 0;
+  ASSERT_TRUE(lSignal.interrupt(
+      [&] {
+        lRawResult = read(mPipe[0], &lByte, 1);
+        lRawErrno = errno;
+      },
+      [] {}));
+  ASSERT_EQ(-1, lRawResult);
+  ASSERT_EQ(EINTR, lRawErrno);
+
+  unsigned int lRead = 0;
+  bool lFailed = false;
+  ASSERT_TRUE(lSignal.interrupt(
+      [&] {
+        try {
+          lRead = ClibRead(mPipe[0], &lByte, 1);
+        } catch (QNCReadFailedEx&) {
+          lFailed = true;
+        }
+      },
+      [&] { ClibWrite(mPipe[1], "r", 1); }));
+  EXPECT_FALSE(lFailed);
+  EXPECT_EQ(1u, lRead);
+  EXPECT_EQ('r', lByte);
+}
+
+// A write blocked on a full pipe and interrupted returns what it wrote so far; the wrapper must
+// write the rest, and the reader must get every byte once.
+TEST_F(ClibTest, SignalDuringABlockedWriteLosesNoByte) {
+  InterruptingSignal lSignal;
+  const std::string lSent(1 << 20, 'w');
+  unsigned int lWritten = 0;
+  size_t lReceived = 0;
+  ASSERT_TRUE(lSignal.interrupt(
+      [&] { lWritten = ClibWrite(mPipe[1], lSent.data(), static_cast<unsigned int>(lSent.size())); },
+      [&] {
+        char lChunk[65536];
+        while (lReceived < lSent.size()) lReceived += ClibRead(mPipe[0], lChunk, sizeof lChunk);
+      }));
+  EXPECT_EQ(lSent.size(), lWritten);
+  EXPECT_EQ(lSent.size(), lReceived);
+}
+
+TEST_F(ClibTest, SleepGoesOnAfterASignal) {
+  InterruptingSignal lSignal;
+  std::chrono::steady_clock::duration lSlept{};
+  ASSERT_TRUE(lSignal.interrupt(
+      [&] {
+        const auto lStart = std::chrono::steady_clock::now();
+        ClibSleepMS(400);
+        lSlept = std::chrono::steady_clock::now() - lStart;
+      },
+      [] {}));
+  EXPECT_GE(lSlept, milliseconds(400));
+  EXPECT_LT(lSlept, milliseconds(400 + 5000));
+}
+
+TEST_F(ClibTest, ProcStatusTellsExistingFromGoneAndRefusesGroups) {
+  EXPECT_EQ(0, ClibGetProcStatus(ClibGetpid()));
+  EXPECT_EQ(0, ClibGetProcStatus(1));  // exists always; may belong to another user (EPERM)
+
+  const pid_t lChild = fork();
+  if (lChild == 0) _exit(0);
+  ASSERT_EQ(0, qntest::waitExit(lChild));  // reaped: the pid names no process now
+  try {
+    ClibGetProcStatus(lChild);
+    ADD_FAILURE() << "a reaped child still exists";
+  } catch (QNCClibGetProcStatusFailedEx& arFailure) {
+    EXPECT_EQ(static_cast<unsigned int>(ESRCH), arFailure.getCode());
+    EXPECT_EQ("kill(signal 0) pid " + std::to_string(lChild) + ": No such process",
+              std::string(arFailure.what()));
+  }
+
+  // kill(0, 0) and kill(-1, 0) would succeed (they probe process groups): refusal proves they
+  // were never made.
+  for (int lPid : {0, -1, -12345}) {
+    try {
+      ClibGetProcStatus(lPid);
+      ADD_FAILURE() << "pid " << lPid << " taken as a process";
+    } catch (QNCClibGetProcStatusFailedEx& arFailure) {
+      EXPECT_EQ(static_cast<unsigned int>(EINVAL), arFailure.getCode());
+    }
+  }
+}
+
+TEST_F(ClibTest, TextsAreCutToTheBufferAndTerminated) {
+  char lText[512];
+  errno = EACCES;
+  ClibStrerror(lText, sizeof lText);
+  EXPECT_STREQ("Permission denied", lText);
+  EXPECT_EQ(EACCES, errno);
+  char lShort[8];
+  memset(lShort, 'x', sizeof lShort);
+  ClibStrerror(lShort, sizeof lShort);
+  EXPECT_STREQ("Permiss", lShort);
+
+  struct utsname lName;
+  ASSERT_EQ(0, uname(&lName));
+  char lHost[256];
+  ClibGethostname(lHost, sizeof lHost);
+  EXPECT_STREQ(lName.nodename, lHost);
+  char lCut[3];
+  memset(lCut, 'x', sizeof lCut);
+  ClibGethostname(lCut, sizeof lCut);
+  EXPECT_EQ(std::string(lName.nodename).substr(0, 2), std::string(lCut));
+}
+
+}  // namespace
