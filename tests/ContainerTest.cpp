@@ -211,7 +211,8 @@ TEST_F(ContainerTest, QueueCopyIntoARecycledNodeFailsAsOutOfMemory) {
   lQueue.enqueue(QNSRecyclable(2));
   EXPECT_EQ(1, lQueue.dequeue().mValue);  // leaves a node to recycle
   QNSRecyclable::sFailCopies = true;
-  expectThrown<QNCNoMemoryEx>([&] { lQueue.enqueue(QNSRecyclable(3)); }, "Out of Memory", 2);
+  const QNSRecyclable lThree(3);  // an lvalue: enqueue must copy it into the recycled node
+  expectThrown<QNCNoMemoryEx>([&] { lQueue.enqueue(lThree); }, "Out of Memory", 2);
   QNSRecyclable::sFailCopies = false;
   EXPECT_EQ(1u, lQueue.numberOfElements());
   lQueue.enqueue(QNSRecyclable(4));
