@@ -79,14 +79,6 @@ void QNCSystem::waitOnEmptyList(unsigned int acConditionNo, unsigned int acListN
   QN_ASSERT(acListNo < this->mLists.numberOfElements());
   QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
   QNCSynchList& lList = *mLists[acListNo];
-  // A list that holds an element needs no conditional: a consumer that keeps up with its
-  // producers then takes only the list's lock, and does not contend with their signal() for the
-  // conditional's. An element removed by another thread meanwhile is the same race that any
-  // return from this wait has with other consumers.
-  if (!lList.isEmpty()) {
-    QN_LEFT();
-    return;
-  }
   QN_LOG_TRACE("Locking the wait conditional");
   lConditional.lock();
   try {
