@@ -206,7 +206,8 @@ TEST_F(ContainerTest, QueueCopyIntoARecycledNodeFailsAsOutOfMemory) {
   lQueue.enqueue(QNSRecyclable(2));
   EXPECT_EQ(1, lQueue.dequeue().mValue);  // leaves a node to recycle
   QNSRecyclable::sFailCopies = true;
-  EXPECT_EQ(kNoMemory, qntest::thrown<QNCNoMemoryEx>([&] { lQueue.enqueue(QNSRecyclable(3)); }, true));
+  const QNSRecyclable lThree(3);  // an lvalue: enqueue must copy it into the recycled node
+  EXPECT_EQ(kNoMemory, qntest::thrown<QNCNoMemoryEx>([&] { lQueue.enqueue(lThree); }, true));
   QNSRecyclable::sFailCopies = false;
   EXPECT_EQ(1u, lQueue.numberOfElements());
   lQueue.enqueue(QNSRecyclable(4));

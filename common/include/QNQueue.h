@@ -39,6 +39,19 @@ class QNCQueue {
     mList.pushBack(acrElement);
   }
 
+  // The same, moving the element in: a caller that made its copy before taking its lock keeps
+  // the copy's cost out of the locked section.
+  void enqueue(T&& arElement) {
+    if constexpr (kRecycles) {
+      if (!mSpare.isEmpty()) {
+        *mSpare.begin() = std::move(arElement);
+        mList.spliceBack(mSpare, mSpare.begin());
+        return;
+      }
+    }
+    mList.pushBack(arElement);
+  }
+
   T dequeue() {
     if constexpr (kRecycles) {
       T lHead(std::move(mList.front()));  // front() throws on an empty queue
