@@ -89,40 +89,20 @@ class ClibTest : public ::testing::Test {
 
 TEST_F(ClibTest, FailuresNameTheCallTheObjectAndTheSystemText) {
   const std::string lMissing = mDir.file("missing/x.pid");
-  try {
-    ClibOpen(lMissing.c_str(), O_RDONLY, 0);
-    ADD_FAILURE() << "opened a missing file";
-  } catch (QNCOpenFailedEx& arFailure) {
-    EXPECT_EQ("open '" + lMissing + "': No such file or directory", std::string(arFailure.what()));
-    EXPECT_EQ(static_cast<unsigned int>(ENOENT), arFailure.getCode());
-  }
-
+  EXPECT_EQ("open '" + lMissing + "': No such file or directory (code " + std::to_string(ENOENT) + ")",
+            qntest::thrown<QNCOpenFailedEx>([&] { ClibOpen(lMissing.c_str(), O_RDONLY, 0); }, true));
   struct stat lStat;
-  try {
-    ClibStat(lMissing.c_str(), &lStat);
-    ADD_FAILURE() << "stat of a missing file";
-  } catch (QNCClibStatFailedEx& arFailure) {
-    EXPECT_EQ("stat '" + lMissing + "': No such file or directory", std::string(arFailure.what()));
-  }
+  EXPECT_EQ("stat '" + lMissing + "': No such file or directory",
+            qntest::thrown<QNCClibStatFailedEx>([&] { ClibStat(lMissing.c_str(), &lStat); }));
 
   const std::string lFile = mDir.file("log");
   const int lWriteOnly = ClibOpen(lFile.c_str(), O_WRONLY | O_CREAT, 0600);
   char lByte;
-  try {
-    ClibRead(lWriteOnly, &lByte, 1);
-    ADD_FAILURE() << "read from a write-only descriptor";
-  } catch (QNCReadFailedEx& arFailure) {
-    EXPECT_EQ("read fd " + std::to_string(lWriteOnly) + " '" + lFile + "': Bad file descriptor",
-              std::string(arFailure.what()));
-  }
+  EXPECT_EQ("read fd " + std::to_string(lWriteOnly) + " '" + lFile + "': Bad file descriptor",
+            qntest::thrown<QNCReadFailedEx>([&] { ClibRead(lWriteOnly, &lByte, 1); }));
   ClibClose(lWriteOnly);
-  try {
-    ClibClose(lWriteOnly);
-    ADD_FAILURE() << "closed a descriptor twice";
-  } catch (QNCCloseFailedEx& arFailure) {
-    EXPECT_EQ("close fd " + std::to_string(lWriteOnly) + ": Bad file descriptor",
-              std::string(arFailure.what()));
-  }
+  EXPECT_EQ("close fd " + std::to_string(lWriteOnly) + ": Bad file descriptor",
+            qntest::thrown<QNCCloseFailedEx>([&] { ClibClose(lWriteOnly); }));
   EXPECT_THROW(ClibChdir(lMissing.c_str()), QNCOpenFailedEx);
 }
 
@@ -232,24 +212,17 @@ TEST_F(ClibTest, ProcStatusTellsExistingFromGoneAndRefusesGroups) {
   const pid_t lChild = fork();
   if (lChild == 0) _exit(0);
   ASSERT_EQ(0, qntest::waitExit(lChild));  // reaped: the pid names no process now
-  try {
-    ClibGetProcStatus(lChild);
-    ADD_FAILURE() << "a reaped child still exists";
-  } catch (QNCClibGetProcStatusFailedEx& arFailure) {
-    EXPECT_EQ(static_cast<unsigned int>(ESRCH), arFailure.getCode());
-    EXPECT_EQ("kill(signal 0) pid " + std::to_string(lChild) + ": No such process",
-              std::string(arFailure.what()));
-  }
+  EXPECT_EQ("kill(signal 0) pid " + std::to_string(lChild) + ": No such process (code " +
+                std::to_string(ESRCH) + ")",
+            qntest::thrown<QNCClibGetProcStatusFailedEx>([&] { ClibGetProcStatus(lChild); }, true));
 
   // kill(0, 0) and kill(-1, 0) would succeed (they probe process groups): refusal proves they
   // were never made.
   for (int lPid : {0, -1, -12345}) {
-    try {
-      ClibGetProcStatus(lPid);
-      ADD_FAILURE() << "pid " << lPid << " taken as a process";
-    } catch (QNCClibGetProcStatusFailedEx& arFailure) {
-      EXPECT_EQ(static_cast<unsigned int>(EINVAL), arFailure.getCode());
-    }
+    const std::string lRefusal =
+        qntest::thrown<QNCClibGetProcStatusFailedEx>([&] { ClibGetProcStatus(lPid); }, true);
+    EXPECT_NE(std::string::npos, lRefusal.find("(code " + std::to_string(EINVAL) + ")"))
+        << lPid << ": " << lRefusal;
   }
 }
 

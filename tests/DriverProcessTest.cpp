@@ -9,9 +9,11 @@
 #include <vector>
 
 #include "DeathTestSupport.h"
+#include "LogSupport.h"
 #include "TestSupport.h"
 
 namespace {
+using qntest::expectInOrder;
 
 const std::vector<std::string> kStartUpSteps = {
     "preInit",      "processCommandLine", "parseConfigFile", "applySettings",   "markAsRunning",
@@ -38,16 +40,6 @@ class DriverProcessTest : public ::testing::Test {
   std::string output() const { return qntest::readFile(stdoutPath()); }
   std::string errors() const { return qntest::readFile(stderrPath()); }
   std::string log() const { return qntest::readFile(mDir.file("driver_app.log")); }
-
-  // Each text in order, every one after the previous one.
-  static void expectInOrder(const std::string& acrHaystack, const std::vector<std::string>& acrTexts) {
-    size_t lFrom = 0;
-    for (const auto& lText : acrTexts) {
-      const size_t lAt = acrHaystack.find(lText, lFrom);
-      ASSERT_NE(std::string::npos, lAt) << "\"" << lText << "\" missing or out of order in:\n" << acrHaystack;
-      lFrom = lAt + lText.size();
-    }
-  }
 
   qntest::TempDir mDir;
 };
@@ -124,9 +116,7 @@ TEST_F(DriverProcessTest, MissingConfigFileParsingIsLoggedOnceAndStartUpGoesOn) 
   ASSERT_EQ(0, qntest::waitExit(lPid)) << output();
   const std::string lLog = log();
   ASSERT_EQ(1u, qntest::countOf(lLog, "Config file parsing not implemented.")) << lLog;
-  const size_t lAt = lLog.find("Config file parsing not implemented.");
-  const size_t lLineStart = lLog.rfind('\n', lAt) == std::string::npos ? 0 : lLog.rfind('\n', lAt) + 1;
-  EXPECT_NE(std::string::npos, lLog.substr(lLineStart, lAt - lLineStart).find("-E-"));
+  EXPECT_EQ("-E-", qntest::levelOf(lLog, "Config file parsing not implemented."));
   expectInOrder(lLog, {"step parseConfigFile", "Config file parsing not implemented.", "step applySettings",
                        "step createStartUpEvent", "Destroying the Logger. You won't see any more logs!"});
 }

@@ -10,6 +10,7 @@
 #include "QNString.h"
 #include "System.h"
 #include "SystemGlobals.h"
+#include "programs/TestSystem.h"
 
 namespace {
 
@@ -22,21 +23,20 @@ class DriverTest : public ::testing::Test {
     // Death tests here must start from the process's initial globals, not a copy of this one's.
     GTEST_FLAG_SET(death_test_style, "threadsafe");
   }
-  void TearDown() override {
-    if (mHadDir) {
-      setenv("QN_LOG_DIR", mSavedDir.c_str(), 1);
-    } else {
-      unsetenv("QN_LOG_DIR");
-    }
-  }
+  void TearDown() override { setDir(mHadDir ? mSavedDir.c_str() : nullptr); }
 
-  // The log path that setLogFilePath composes with QN_LOG_DIR set to apDir (unset when null).
-  static std::string composed(const char* apDir, const std::string& acrName) {
+  // Sets QN_LOG_DIR to apDir, or unsets it when apDir is null.
+  static void setDir(const char* apDir) {
     if (apDir != nullptr) {
       setenv("QN_LOG_DIR", apDir, 1);
     } else {
       unsetenv("QN_LOG_DIR");
     }
+  }
+
+  // The log path that setLogFilePath composes with QN_LOG_DIR set to apDir.
+  static std::string composed(const char* apDir, const std::string& acrName) {
+    setDir(apDir);
     setLogFilePath(acrName.c_str());
     QNCString lPath("stale");
     getLogFilePath(lPath);
@@ -44,11 +44,7 @@ class DriverTest : public ::testing::Test {
   }
 
   static std::string logDir(const char* apDir) {
-    if (apDir != nullptr) {
-      setenv("QN_LOG_DIR", apDir, 1);
-    } else {
-      unsetenv("QN_LOG_DIR");
-    }
+    setDir(apDir);
     QNCString lDir("stale");
     getLogDir(lDir);
     return lDir.get();
@@ -78,13 +74,11 @@ TEST_F(DriverTest, LogPathIsCutTo511Characters) {
   EXPECT_EQ("/tmp/a", composed(nullptr, "a"));
 }
 
+// The directory is read from the environment each time, never taken from the log path.
 TEST_F(DriverTest, LogDirIsTheVariableEvenWhenEmptyElseTmp) {
   EXPECT_EQ("/tmp", logDir(nullptr));
   EXPECT_EQ("/var/log/app", logDir("/var/log/app"));
   EXPECT_EQ("", logDir(""));
-}
-
-TEST_F(DriverTest, LogDirDoesNotLookAtTheLogPath) {
   EXPECT_EQ("/first/x.log", composed("/first", "x.log"));
   EXPECT_EQ("/second", logDir("/second"));
   EXPECT_EQ("/tmp", logDir(nullptr));
@@ -101,13 +95,10 @@ TEST_F(DriverTest, LogPathIsEmptyBeforeItIsSet) {
 }
 
 // A system object for the registration tests; it only counts its destruction.
-class QNCRegisteredSystem : public QNCSystem {
+class QNCRegisteredSystem : public QNCBareTestSystem {
  public:
   explicit QNCRegisteredSystem(int* apDestroyed) : mpDestroyed(apDestroyed) {}
   ~QNCRegisteredSystem() override { ++*mpDestroyed; }
-  void setCommandLineArgumentDesc() override {}
-  void parseConfigFile(QNCString&) override {}
-  void displayHelp() override {}
 
  private:
   int* mpDestroyed;

@@ -16,23 +16,21 @@ namespace {
   throw lException;
 }
 
-TEST(ExceptionTest, NoMemoryIsCaughtThroughEveryBase) {
-  try {
-    throw QNCNoMemoryEx("Out of Memory", 2);
-  } catch (QNCGenericException& arException) {
-    EXPECT_STREQ("Out of Memory", arException.what());
-  }
-  try {
-    throw QNCNoMemoryEx("Out of Memory", 2);
-  } catch (QNCHaltEx& arException) {
-    EXPECT_STREQ("Out of Memory", arException.what());
-  }
-  try {
-    throw QNCNoMemoryEx("Out of Memory", 2);
-  } catch (QNCException& arException) {
-    EXPECT_STREQ("Out of Memory", arException.what());
-    EXPECT_EQ(2u, arException.getCode());
-  }
+// Each class is caught through the bases of its category and never through another category.
+TEST(ExceptionTest, ClassesAreCaughtThroughTheirCategoryOnly) {
+  const QNCNoMemoryEx lNoMemory("Out of Memory", 2);
+  const QNCException& lrNoMemory = lNoMemory;
+  EXPECT_NE(nullptr, dynamic_cast<const QNCHaltEx*>(&lrNoMemory));
+  EXPECT_NE(nullptr, dynamic_cast<const QNCGenericException*>(&lrNoMemory));
+  EXPECT_EQ(nullptr, dynamic_cast<const QNCOsException*>(&lrNoMemory));
+  EXPECT_STREQ("Out of Memory", lrNoMemory.what());
+  EXPECT_EQ(2u, lrNoMemory.getCode());
+
+  const QNCExistsEx lExists("Element already exists in map.. can't insert", 10);
+  const QNCException& lrExists = lExists;
+  EXPECT_NE(nullptr, dynamic_cast<const QNCGenericException*>(&lrExists));
+  EXPECT_EQ(nullptr, dynamic_cast<const QNCOsException*>(&lrExists));
+  EXPECT_EQ(nullptr, dynamic_cast<const QNCHaltEx*>(&lrExists));
 }
 
 TEST(ExceptionTest, MessageSurvivesTheBufferItCameFrom) {
@@ -48,20 +46,6 @@ TEST(ExceptionTest, OverlongMessageIsCutNotOverflowed) {
   const std::string lLong(5000, 'm');
   const QNCInvalidEx lException(lLong.c_str(), 6);
   EXPECT_EQ(QNCException::kMaxMessage - 1, strlen(lException.what()));
-}
-
-TEST(ExceptionTest, CategoryDoesNotCatchAnotherCategory) {
-  bool lCaughtAsOs = false;
-  try {
-    try {
-      throw QNCExistsEx("Element already exists in map.. can't insert", 10);
-    } catch (QNCOsException&) {
-      lCaughtAsOs = true;
-    }
-  } catch (QNCGenericException& arException) {
-    EXPECT_EQ(10u, arException.getCode());
-  }
-  EXPECT_FALSE(lCaughtAsOs);
 }
 
 }  // namespace

@@ -4,18 +4,13 @@
 
 #include "MultiType.h"
 #include "QNException.h"
+#include "TestSupport.h"
 
 namespace {
 
-// The message of the QNCInvalidEx that acrCall throws, or "" when it throws none.
 template <class Call>
 std::string invalidMessage(const Call& acrCall) {
-  try {
-    acrCall();
-  } catch (const QNCInvalidEx& acrException) {
-    return acrException.what();
-  }
-  return "";
+  return qntest::thrown<QNCInvalidEx>(acrCall);
 }
 
 TEST(MultiTypeTest, ConversionToAKindNotHeldIsRefusedWithBothKindsNamed) {

@@ -8,6 +8,7 @@
 #include <thread>
 #include <vector>
 
+#include "LogSupport.h"
 #include "Logger.h"
 #include "Mutex.h"
 #include "QNException.h"
@@ -42,16 +43,13 @@ TEST(MutexTest, LockerExcludesOtherThreadsAndReleasesOnException) {
 
 // Destroying a mutex that is still locked makes pthread_mutex_destroy fail with EBUSY; the
 // destructor must swallow that, trace it, and still end with "Left".
-TEST(MutexTest, FailedDestructionIsTracedAndIgnored) {
+class MutexLogTest : public qntest::LoggedTest {};
+
+TEST_F(MutexLogTest, FailedDestructionIsTracedAndIgnored) {
 #if defined(__SANITIZE_THREAD__)
   GTEST_SKIP() << "ThreadSanitizer itself reports the destruction of a locked mutex as an error, "
                   "which is exactly what this case provokes; the other builds cover it";
 #endif
-  qntest::TempDir lDir;
-  const std::string lLog = lDir.file("mutex.log");
-  setLogCode(255);
-  CreateLogger(QNCString(lLog.c_str()));
-
   {
     QNCMutex lUnlocked;  // control: a normal destruction traces no failure
   }
@@ -65,9 +63,7 @@ TEST(MutexTest, FailedDestructionIsTracedAndIgnored) {
   EXPECT_EQ(0, pthread_mutex_unlock(lpSystemMutex));
   EXPECT_EQ(0, pthread_mutex_destroy(lpSystemMutex));
 
-  flushLogger();
-  destroyLogger();
-  const std::string lText = qntest::readFile(lLog);
+  const std::string lText = log();
   // The destructor's own lines, in order: the control's pair, then the failed one's three.
   std::vector<std::string> lLines;
   size_t lStart = 0;

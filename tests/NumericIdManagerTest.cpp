@@ -4,6 +4,7 @@
 
 #include "NumericIdManager.h"
 #include "QNException.h"
+#include "TestSupport.h"
 
 namespace {
 
@@ -31,13 +32,8 @@ TEST(NumericIdManagerTest, ReturningAnIdNotInUseIsRefused) {
   lManager.getNextId(lId);
 
   for (unsigned int lNeverIssued : {0u, 3u, 4294967295u}) {
-    try {
-      lManager.markForReuse(lNeverIssued);
-      ADD_FAILURE() << lNeverIssued << " was accepted";
-    } catch (const QNCInvalidEx& acrException) {
-      EXPECT_EQ("Numeric identifier " + std::to_string(lNeverIssued) + " is not in use, cannot return it",
-                std::string(acrException.what()));
-    }
+    EXPECT_EQ("Numeric identifier " + std::to_string(lNeverIssued) + " is not in use, cannot return it",
+              qntest::thrown<QNCInvalidEx>([&] { lManager.markForReuse(lNeverIssued); }));
   }
   // A double return would later hand 1 to two users at once.
   lManager.markForReuse(1);
@@ -48,30 +44,24 @@ TEST(NumericIdManagerTest, ReturningAnIdNotInUseIsRefused) {
   EXPECT_EQ(3u, lId) << "1 was queued twice";
 }
 
+// Bounds of 3, 1 and 0: the bound is the last identifier handed out, and a return frees one.
 TEST(NumericIdManagerTest, ExhaustionThrowsInsteadOfWrappingAndRecoversAfterAReturn) {
   QNCNumericIdManager lManager(3);
   unsigned int lId = 0;
   for (int lCount = 0; lCount < 3; ++lCount) lManager.getNextId(lId);
   lId = 77;
-  try {
-    lManager.getNextId(lId);
-    ADD_FAILURE() << "a fourth identifier was handed out: " << lId;
-  } catch (const QNCNotFoundEx& acrException) {
-    EXPECT_STREQ("No numeric identifier is free: all of 1..3 are in use", acrException.what());
-  }
+  EXPECT_EQ("No numeric identifier is free: all of 1..3 are in use",
+            qntest::thrown<QNCNotFoundEx>([&] { lManager.getNextId(lId); }));
   EXPECT_EQ(77u, lId);
   lManager.markForReuse(2);
   lManager.getNextId(lId);
   EXPECT_EQ(2u, lId);
   EXPECT_THROW(lManager.getNextId(lId), QNCNotFoundEx);
-}
 
-TEST(NumericIdManagerTest, BoundsOfOneAndZeroAreHonoured) {
-  QNCNumericIdManager lManager(1);
-  unsigned int lId = 0;
-  lManager.getNextId(lId);
+  QNCNumericIdManager lOne(1);
+  lOne.getNextId(lId);
   EXPECT_EQ(1u, lId);
-  EXPECT_THROW(lManager.getNextId(lId), QNCNotFoundEx);
+  EXPECT_THROW(lOne.getNextId(lId), QNCNotFoundEx);
   QNCNumericIdManager lEmpty(0);
   EXPECT_THROW(lEmpty.getNextId(lId), QNCNotFoundEx);
 }

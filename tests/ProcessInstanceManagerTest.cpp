@@ -3,6 +3,7 @@
 // conflict like separate processes); process cases start qn_instance_tool as real instances.
 
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -13,8 +14,7 @@
 #include <thread>
 #include <vector>
 
-#include <gtest/gtest.h>
-
+#include "DeathTestSupport.h"
 #include "Os.h"
 #include "ProcessInstanceManager.h"
 #include "QNException.h"
@@ -76,13 +76,8 @@ TEST_F(InstanceManagerTest, SecondManagerSeesTheInstanceUntilItIsReleased) {
 
   QNCProcessInstanceManager lSecond(mPidFile.c_str());
   EXPECT_TRUE(lSecond.isAnInstanceRunning());
-  try {
-    lSecond.markAsRunning();
-    FAIL() << "a second instance was marked running";
-  } catch (const QNCExistsEx& acrError) {
-    EXPECT_STREQ("Cannot mark running.. found another instance", acrError.what());
-    EXPECT_EQ(10u, acrError.getCode());
-  }
+  EXPECT_EQ("Cannot mark running.. found another instance (code 10)",
+            qntest::thrown<QNCExistsEx>([&] { lSecond.markAsRunning(); }, true));
   EXPECT_EQ(pidBytes(getpid()), qntest::readFile(mPidFile));
   EXPECT_TRUE(lockedByOther(mPidFile));
 
@@ -98,12 +93,9 @@ TEST_F(InstanceManagerTest, KillRefusesToSignalItsOwnProcess) {
   QNCProcessInstanceManager lRunning(mPidFile.c_str());
   lRunning.markAsRunning();
   QNCProcessInstanceManager lKiller(mPidFile.c_str());
-  try {
-    lKiller.killRunningInstance();
-    FAIL() << "killRunningInstance accepted this process's own id";
-  } catch (const QNCTerminateFailedEx& acrError) {
-    EXPECT_EQ(488u, acrError.getCode());
-  }
+  EXPECT_NE(
+      std::string::npos,
+      qntest::thrown<QNCTerminateFailedEx>([&] { lKiller.killRunningInstance(); }, true).find("(code 488)"));
   EXPECT_TRUE(lKiller.isAnInstanceRunning());
   EXPECT_TRUE(lockedByOther(mPidFile));
 }
@@ -162,6 +154,12 @@ class InstanceProcessTest : public InstanceManagerTest {
     return lTool;
   }
 
+  // Ends a holding tool with SIGTERM; it must leave cleanly.
+  static void stop(const Tool& acrTool) {
+    kill(acrTool.mPid, SIGTERM);
+    EXPECT_EQ(0, qntest::waitExit(acrTool.mPid));
+  }
+
   int mCount = 0;
 };
 
@@ -179,8 +177,7 @@ TEST_F(InstanceProcessTest, FirstStartCreatesTheFileWithItsModeAndPid) {
   EXPECT_EQ(pidBytes(lInstance.mPid), qntest::readFile(mPidFile));
   EXPECT_TRUE(lockedByOther(mPidFile));
 
-  kill(lInstance.mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lInstance.mPid));
+  stop(lInstance);
   EXPECT_FALSE(lockedByOther(mPidFile));
   EXPECT_EQ(pidBytes(lInstance.mPid), qntest::readFile(mPidFile));  // never deleted or cleared
 }
@@ -195,8 +192,7 @@ TEST_F(InstanceProcessTest, SecondStartFailsAndLeavesTheFirstUntouched) {
 
   EXPECT_EQ(pidBytes(lFirst.mPid), qntest::readFile(mPidFile));
   EXPECT_TRUE(lockedByOther(mPidFile));
-  kill(lFirst.mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lFirst.mPid));
+  stop(lFirst);
 }
 
 // getProcStatus() opens and closes the instance's own PID file. Were the lock a classic fcntl
@@ -207,8 +203,7 @@ TEST_F(InstanceProcessTest, ProbingItsOwnPidFileKeepsTheLock) {
   Tool lSecond = start("hold");
   EXPECT_EQ(1, qntest::waitExit(lSecond.mPid));
   EXPECT_TRUE(lockedByOther(mPidFile));
-  kill(lFirst.mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lFirst.mPid));
+  stop(lFirst);
 }
 
 // Also pins a lost id: A and B find no file; A creates it, locks, writes its id and runs on; B's
@@ -249,8 +244,7 @@ TEST_F(InstanceProcessTest, TwentySimultaneousStartsLeaveExactlyOneRunning) {
   EXPECT_TRUE(qntest::waitForText(lWinner.mOut, "running"));
   EXPECT_TRUE(lockedByOther(mPidFile));
   EXPECT_EQ(pidBytes(lWinner.mPid), qntest::readFile(mPidFile));
-  kill(lWinner.mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lWinner.mPid));
+  stop(lWinner);
 }
 
 TEST_F(InstanceProcessTest, StartAfterSigkillTakesOverAndKeepsLaterBytes) {
@@ -266,8 +260,7 @@ TEST_F(InstanceProcessTest, StartAfterSigkillTakesOverAndKeepsLaterBytes) {
 
   Tool lNext = startRunning();
   EXPECT_EQ(pidBytes(lNext.mPid) + "extra", qntest::readFile(mPidFile));
-  kill(lNext.mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lNext.mPid));
+  stop(lNext);
 }
 
 TEST_F(InstanceProcessTest, KillStopsAnInstanceThatEndsOnSigterm) {
@@ -291,12 +284,7 @@ TEST_F(InstanceProcessTest, KillGivesUpOnAnInstanceIgnoringSigterm) {
   const std::string lLog = qntest::readFile(lKiller.mLog);
   EXPECT_NE(std::string::npos, lLog.find("Failed in terminating Instance with pid " + std::to_string(lStubborn.mPid)))
       << lLog;
-  size_t lSleeps = 0;
-  for (size_t lAt = lLog.find("Sleep for 1 second..."); lAt != std::string::npos;
-       lAt = lLog.find("Sleep for 1 second...", lAt + 1)) {
-    ++lSleeps;
-  }
-  EXPECT_EQ(10u, lSleeps);
+  EXPECT_EQ(10u, qntest::countOf(lLog, "Sleep for 1 second..."));
   EXPECT_TRUE(lockedByOther(mPidFile));  // still running, still the instance
   kill(lStubborn.mPid, SIGKILL);
   EXPECT_EQ(128 + SIGKILL, qntest::waitExit(lStubborn.mPid));
@@ -319,8 +307,7 @@ TEST_F(InstanceProcessTest, KillSignalsNobodyForAShortOrZeroId) {
     EXPECT_EQ(acrContents, qntest::readFile(mPidFile));
     // The holder got no SIGTERM: it still holds the lock, and ends only when we signal it.
     EXPECT_TRUE(lockedByOther(mPidFile));
-    kill(lHolder.mPid, SIGTERM);
-    EXPECT_EQ(0, qntest::waitExit(lHolder.mPid));
+    stop(lHolder);
   }
 }
 }  // namespace

@@ -214,20 +214,19 @@ TEST_F(QnsensordCommandLineTest, ConfigFileWithoutARequiredKeyStopsStartUp) {
 }
 
 TEST_F(QnsensordCommandLineTest, MalformedConfigFileIsReportedWithItsLine) {
-  std::string lPath = writeConfig("DebugLevel = 255\nHbTimeout = 30\nDaemonize\n");
-  QnsensordRun lRun = run({"-c", lPath});
-  EXPECT_NE(0, lRun.mStatus);
-  EXPECT_TRUE(contains(lRun.mStderr, lPath + ":3:")) << lRun.mStderr;
-
-  lPath = writeConfig("DebugLevel = 255\nHbTimeout = soon\nDaemonize = 0\n");
-  lRun = run({"-c", lPath});
-  EXPECT_NE(0, lRun.mStatus);
-  EXPECT_TRUE(contains(lRun.mStderr, lPath + ":2: HbTimeout: 'soon' is not an unsigned integer")) << lRun.mStderr;
-
-  lPath = writeConfig("DebugLevel = 255\nHbTimeout = 30\nDaemonize = 0\nDebugLevl = 8\n");
-  lRun = run({"-c", lPath});
-  EXPECT_NE(0, lRun.mStatus);
-  EXPECT_TRUE(contains(lRun.mStderr, lPath + ":4: unknown key 'DebugLevl'")) << lRun.mStderr;
+  const std::vector<std::pair<std::string, std::string>> lCases = {
+      {"DebugLevel = 255\nHbTimeout = 30\nDaemonize\n", ":3:"},
+      {"DebugLevel = 255\nHbTimeout = soon\nDaemonize = 0\n",
+       ":2: HbTimeout: 'soon' is not an unsigned integer"},
+      {"DebugLevel = 255\nHbTimeout = 30\nDaemonize = 0\nDebugLevl = 8\n", ":4: unknown key 'DebugLevl'"},
+  };
+  for (const auto& lrCase : lCases) {
+    SCOPED_TRACE(lrCase.second);
+    const std::string lPath = writeConfig(lrCase.first);
+    const QnsensordRun lRun = run({"-c", lPath});
+    EXPECT_NE(0, lRun.mStatus);
+    EXPECT_TRUE(contains(lRun.mStderr, lPath + lrCase.second)) << lRun.mStderr;
+  }
 }
 
 TEST_F(QnsensordCommandLineTest, BadCommandLineIsAUsageErrorWithNothingStarted) {

@@ -1,11 +1,11 @@
 #include <gtest/gtest.h>
-
 #include <unistd.h>
 
 #include <cstdio>
 #include <string>
 #include <vector>
 
+#include "LogSupport.h"
 #include "Logger.h"
 #include "MultiType.h"
 #include "QNException.h"
@@ -57,22 +57,14 @@ class CommandLineTestSystem : public QNCSystem {
     processCommandLine(static_cast<int>(lStorage.size()), lArgv.data());
   }
 
-  bool has(const char* apKey) { return mSettings.contains(apKey); }
-  unsigned int number(const char* apKey) {
+  QNCMultiType& setting(const char* apKey) {
     QNCPointer<QNCMultiType> lValue;
     getSetting(apKey, lValue);
     return *lValue;
   }
-  int flag(const char* apKey) {
-    QNCPointer<QNCMultiType> lValue;
-    getSetting(apKey, lValue);
-    return static_cast<signed char>(*lValue);
-  }
-  std::string text(const char* apKey) {
-    QNCPointer<QNCMultiType> lValue;
-    getSetting(apKey, lValue);
-    return lValue->getText().get();
-  }
+  unsigned int number(const char* apKey) { return setting(apKey); }
+  int flag(const char* apKey) { return static_cast<signed char>(setting(apKey)); }
+  std::string text(const char* apKey) { return setting(apKey).getText().get(); }
   unsigned int settingCount() const { return mSettings.numberOfElements(); }
 
   bool mInstanceRunning = false;
@@ -83,7 +75,7 @@ class CommandLineTestSystem : public QNCSystem {
 
 // Logs to a file of its own, with a recognisable log mask and heartbeat, so the defaults can be
 // told from constants.
-class SystemCommandLineTest : public ::testing::Test {
+class SystemCommandLineTest : public qntest::LoggedTest {
  protected:
   static constexpr unsigned int kMask = 249;
   static constexpr unsigned int kHeartbeat = 41;
@@ -91,19 +83,14 @@ class SystemCommandLineTest : public ::testing::Test {
   void SetUp() override {
     getLogCode(mSavedLogCode);
     getHbTimeout(mSavedHbTimeout);
+    LoggedTest::SetUp();
     setLogCode(kMask);
     setHbTimeout(kHeartbeat);
-    CreateLogger(mDir.file("test.log").c_str());
   }
   void TearDown() override {
-    destroyLogger();
+    LoggedTest::TearDown();
     setLogCode(mSavedLogCode);
     setHbTimeout(mSavedHbTimeout);
-  }
-
-  std::string log() {
-    flushLogger();
-    return qntest::readFile(mDir.file("test.log"));
   }
 
   // In a death test's child: standard output joins standard error, which EXPECT_EXIT matches.
@@ -112,7 +99,6 @@ class SystemCommandLineTest : public ::testing::Test {
     dup2(STDERR_FILENO, STDOUT_FILENO);
   }
 
-  qntest::TempDir mDir;
   CommandLineTestSystem mSystem;
   unsigned int mSavedLogCode = 0;
   unsigned int mSavedHbTimeout = 0;

@@ -1,5 +1,6 @@
 // Daemonizing (through the real qn_daemon_probe process) and the exit-aware sleep.
 
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -8,8 +9,6 @@
 #include <sstream>
 #include <string>
 #include <thread>
-
-#include <gtest/gtest.h>
 
 #include "QNException.h"
 #include "TestSupport.h"
@@ -69,13 +68,8 @@ class WaitAndCheckExitTest : public ::testing::Test {
 TEST_F(WaitAndCheckExitTest, ZeroSecondsChecksTheFlagWithoutSleeping) {
   EXPECT_NO_THROW(mSystem.waitAndCheckExit(0));
   mSystem.setForExit();
-  try {
-    mSystem.waitAndCheckExit(0);
-    FAIL() << "the exit flag was not noticed";
-  } catch (const QNCHaltEx& acrError) {
-    EXPECT_STREQ("Process is marked for exit.", acrError.what());
-    EXPECT_EQ(1u, acrError.getCode());
-  }
+  EXPECT_EQ("Process is marked for exit. (code 1)",
+            qntest::thrown<QNCHaltEx>([&] { mSystem.waitAndCheckExit(0); }, true));
 }
 
 // A wait of 12 seconds is checked after 5, 10 and 12: a flag set during the first step must end

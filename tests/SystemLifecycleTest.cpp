@@ -1,5 +1,4 @@
 #include <gtest/gtest.h>
-
 #include <unistd.h>
 
 #include <atomic>
@@ -7,6 +6,7 @@
 
 #include "IpAddress.h"
 #include "KeyValueFormatParser.h"
+#include "LogSupport.h"
 #include "Logger.h"
 #include "QNException.h"
 #include "Reader.h"
@@ -15,6 +15,7 @@
 #include "ThreadComponent.h"
 #include "ThreadPool.h"
 #include "Writer.h"
+#include "programs/TestSystem.h"
 
 namespace {
 
@@ -61,7 +62,7 @@ class NullWriter : public QNCWriter {
 };
 
 // The application side of the tests: the three abstract operations, and access to the tables.
-class TestSystem : public QNCSystem {
+class TestSystem : public QNCBareTestSystem {
  public:
   TestSystem() { mName = QNCString("testsystem"); }
   ~TestSystem() override {
@@ -75,8 +76,6 @@ class TestSystem : public QNCSystem {
   }
 
   void setCommandLineArgumentDesc() override { ++mDescriptorCalls; }
-  void parseConfigFile(QNCString&) override { throw QNCNotImplementedEx("no configuration file", 0); }
-  void displayHelp() override {}
   void createShutDownEvent() override {
     ++mShutDownEvents;
     mFlagAtShutDownEvent = isSetForExit();
@@ -101,42 +100,10 @@ class TestSystem : public QNCSystem {
   bool mFlagAtShutDownEvent = true;
 };
 
-// Tests that read the log: each has its own file, flushed before it is read.
-class SystemLifecycleTest : public ::testing::Test {
- protected:
-  void SetUp() override {
-    setLogCode(255);
-    CreateLogger(QNCString(mLogPath.c_str()));
-  }
-  void TearDown() override { destroyLogger(); }
+class SystemLifecycleTest : public qntest::LoggedTest {};
 
-  std::string log() {
-    flushLogger();
-    return qntest::readFile(mLogPath);
-  }
-
-  // Fails unless every text occurs in the log, each after the one before it.
-  static void expectInOrder(const std::string& acrLog, std::initializer_list<std::string> aTexts) {
-    size_t lFrom = 0;
-    for (const std::string& acrText : aTexts) {
-      const size_t lAt = acrLog.find(acrText, lFrom);
-      ASSERT_NE(std::string::npos, lAt) << "'" << acrText << "' missing or out of order in:\n" << acrLog;
-      lFrom = lAt + acrText.size();
-    }
-  }
-
-  // The level tag ("-N-") of the first line that contains the text; "" when there is none.
-  static std::string levelOf(const std::string& acrLog, const std::string& acrText) {
-    const size_t lAt = acrLog.find(acrText);
-    if (lAt == std::string::npos) return "";
-    const size_t lLineStart = acrLog.rfind('\n', lAt) == std::string::npos ? 0 : acrLog.rfind('\n', lAt) + 1;
-    const size_t lTag = acrLog.find(" -", lLineStart);
-    return lTag == std::string::npos || lTag > lAt ? "" : acrLog.substr(lTag + 1, 3);
-  }
-
-  qntest::TempDir mDir;
-  std::string mLogPath = mDir.file("system.log");
-};
+using qntest::expectInOrder;
+using qntest::levelOf;
 
 TEST_F(SystemLifecycleTest, StartsComponentsInOrderBeforePoolsAndWaitsInTheSameOrder) {
   TestSystem lSystem;
@@ -149,13 +116,14 @@ TEST_F(SystemLifecycleTest, StartsComponentsInOrderBeforePoolsAndWaitsInTheSameO
   lSystem.makeThreadsToExit();
   lSystem.waitForThreads();
   const std::string lLog = log();
-  expectInOrder(lLog, {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
-                       "Waiting for 'alpha' thread to exit\n", "Waiting for 'beta' thread to exit\n",
-                       "Waiting for threads in 'workers' ThreadPool to exit\n"});
-  EXPECT_EQ("-N-", levelOf(lLog, "Started Thread: alpha"));
-  EXPECT_EQ("-N-", levelOf(lLog, "Started Threads in Thread Pool: workers"));
-  EXPECT_EQ("-N-", levelOf(lLog, "Waiting for 'alpha' thread to exit"));
-  EXPECT_EQ("-N-", levelOf(lLog, "Waiting for threads in 'workers' ThreadPool to exit"));
+  expectInOrder(
+      lLog, {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
+             "Waiting for 'alpha' thread to exit\n", "Waiting for 'beta' thread to exit\n",
+             "Waiting for threads in 'workers' ThreadPool to exit\n"});
+  for (const char* lpLine :
+       {"Started Thread: alpha", "Started Threads in Thread Pool: workers",
+        "Waiting for 'alpha' thread to exit", "Waiting for threads in 'workers' ThreadPool to exit"})
+    EXPECT_EQ("-N-", levelOf(lLog, lpLine)) << lpLine;
 }
 
 // Nothing is caught in startThreads: the component that cannot start ends it, and neither the
@@ -171,28 +139,19 @@ TEST_F(SystemLifecycleTest, StartThreadsStopsAtTheFirstComponentThatCannotStart)
   EXPECT_EQ(std::string::npos, log().find("Started Thread"));
 }
 
+// isInited is false for every number at or beyond the table size, before and after the start.
 TEST_F(SystemLifecycleTest, StartThreadStartsOneComponentAndRefusesABadIndex) {
   TestSystem lSystem;
+  EXPECT_FALSE(lSystem.isInited(0));
   lSystem.addComponent(new WaitingComponent("solo"));
-  try {
-    lSystem.startThread(1);
-    FAIL() << "index 1 of one component accepted";
-  } catch (const QNCInvalidEx& acrException) {
-    EXPECT_STREQ("Vector out of bounds access", acrException.what());
-  }
+  lSystem.addComponent(new WaitingComponent("other"));
+  EXPECT_EQ("Vector out of bounds access", qntest::thrown<QNCInvalidEx>([&] { lSystem.startThread(2); }));
   EXPECT_FALSE(lSystem.isInited(0));
   lSystem.startThread(0);
   EXPECT_TRUE(lSystem.isInited(0));
+  EXPECT_FALSE(lSystem.isInited(1));
   EXPECT_NE(std::string::npos, log().find("Started Thread: solo\n"));
-}
-
-TEST_F(SystemLifecycleTest, IsInitedIsFalseAtAndBeyondTheNumberOfComponents) {
-  TestSystem lSystem;
-  EXPECT_FALSE(lSystem.isInited(0));
-  lSystem.addComponent(new WaitingComponent("c0"));
-  lSystem.addComponent(new WaitingComponent("c1"));
-  EXPECT_FALSE(lSystem.isInited(0));  // not started yet
-  lSystem.startThreads();
+  lSystem.startThread(1);
   EXPECT_TRUE(lSystem.isInited(1));
   EXPECT_FALSE(lSystem.isInited(2));
   EXPECT_FALSE(lSystem.isInited(~0u));
@@ -268,12 +227,15 @@ TEST_F(SystemLifecycleTest, InitFindsTheHostNameAndAddress) {
   const std::string lNumber = std::to_string(lSystem.getAddress()->getNumericForm());
   const std::string lLog = log();
   expectInOrder(lLog, {std::string("HostName: ") + lHostName + "\n", "Setting IP Address...",
-                       "The IP Address of the host in number form: " + lNumber + " \n", "Setting the IP Address",
-                       "IpAddress: " + lAddress + "\n"});
-  EXPECT_EQ("-N-", levelOf(lLog, "HostName: "));
-  EXPECT_EQ("-T-", levelOf(lLog, "Setting IP Address..."));
-  EXPECT_EQ("-I-", levelOf(lLog, "The IP Address of the host in number form: "));
-  EXPECT_EQ("-N-", levelOf(lLog, "IpAddress: "));
+                       "The IP Address of the host in number form: " + lNumber + " \n",
+                       "Setting the IP Address", "IpAddress: " + lAddress + "\n"});
+  const std::pair<const char*, const char*> lLevels[] = {
+      {"HostName: ", "-N-"},
+      {"Setting IP Address...", "-T-"},
+      {"The IP Address of the host in number form: ", "-I-"},
+      {"IpAddress: ", "-N-"}};
+  for (const auto& lrLevel : lLevels)
+    EXPECT_EQ(lrLevel.second, levelOf(lLog, lrLevel.first)) << lrLevel.first;
 }
 
 // Death tests run without a logger, so the assertion line reaches standard error.

@@ -6,6 +6,7 @@
 #include <stdexcept>
 #include <string>
 
+#include "LogSupport.h"
 #include "Logger.h"
 #include "QNException.h"
 #include "TestSupport.h"
@@ -91,42 +92,27 @@ TEST(ThreadComponentTest, ARequestMadeBeforeTheWaitIsNotLost) {
   EXPECT_TRUE(lSeen);
 }
 
-TEST(ThreadComponentTest, WaitWithoutARequestReportsNoRequest) {
-  std::atomic<int> lResult{-1};
-  ScriptedComponent lComponent("idle", [&](ScriptedComponent& arSelf) {
-    lResult = arSelf.waitForExitRequest(1) ? 1 : 0;
-  });
-  lComponent.init();
-  lComponent.waitForExit();
-  EXPECT_EQ(0, lResult);
-  EXPECT_FALSE(lComponent.isExitRequested());
-}
-
-TEST(ThreadComponentTest, RequestBeforeInitIsRefusedAndNotRemembered) {
-  std::atomic<int> lRequestedAtStart{-1};
-  ScriptedComponent lComponent("early", [&](ScriptedComponent& arSelf) {
-    lRequestedAtStart = arSelf.isExitRequested() ? 1 : 0;
-  });
-  try {
-    lComponent.requestExit();
-    FAIL() << "requestExit before init must throw";
-  } catch (const QNCInvalidEx& acrException) {
-    EXPECT_STREQ("Thread 'early' was never started", acrException.what());
-  }
-  lComponent.init();
-  lComponent.waitForExit();
-  EXPECT_EQ(0, lRequestedAtStart);
-}
-
+// A request before init() is refused and not remembered; a wait without a request reports none;
+// init() runs once; joins and requests after the end are no-ops.
 TEST(ThreadComponentTest, LifecycleStatesAndRepeatedCalls) {
-  ScriptedComponent lComponent("once", [](ScriptedComponent&) {});
+  std::atomic<int> lRequestedAtStart{-1};
+  std::atomic<int> lWaitResult{-1};
+  ScriptedComponent lComponent("once", [&](ScriptedComponent& arSelf) {
+    lRequestedAtStart = arSelf.isExitRequested() ? 1 : 0;
+    lWaitResult = arSelf.waitForExitRequest(1) ? 1 : 0;
+  });
+  EXPECT_EQ("Thread 'once' was never started",
+            qntest::thrown<QNCInvalidEx>([&] { lComponent.requestExit(); }));
   EXPECT_FALSE(lComponent.isInited());
   lComponent.waitForExit();  // never started: returns at once
   lComponent.init();
   EXPECT_TRUE(lComponent.isInited());
   EXPECT_THROW(lComponent.init(), QNCInvalidEx);
   lComponent.waitForExit();
-  lComponent.waitForExit();  // already joined: returns at once
+  EXPECT_EQ(0, lRequestedAtStart);
+  EXPECT_EQ(0, lWaitResult);
+  EXPECT_FALSE(lComponent.isExitRequested());
+  lComponent.waitForExit();            // already joined: returns at once
   EXPECT_TRUE(lComponent.isInited());  // started once, stays so after the end
   lComponent.requestExit();  // the thread has ended: no effect, no failure
   EXPECT_STREQ("once", lComponent.getName().get());
@@ -150,10 +136,9 @@ TEST(ThreadComponentTest, WaitingForItsOwnExitIsRefused) {
 
 // An exception leaving a thread function would call std::terminate; here each one is logged
 // with its message and the test process lives on to read the log.
-TEST(ThreadComponentTest, AnExceptionFromTheBodyIsLoggedAndTheProcessGoesOn) {
-  qntest::TempDir lDir;
-  const std::string lLog = lDir.file("component.log");
-  CreateLogger(QNCString(lLog.c_str()));
+class ThreadComponentLogTest : public qntest::LoggedTest {};
+
+TEST_F(ThreadComponentLogTest, AnExceptionFromTheBodyIsLoggedAndTheProcessGoesOn) {
   {
     ScriptedComponent lFamily("family", [](ScriptedComponent&) { throw QNCInvalidEx("sensor lost", 6); });
     ScriptedComponent lStandard("standard", [](ScriptedComponent&) { throw std::runtime_error("bus error"); });
@@ -165,9 +150,7 @@ TEST(ThreadComponentTest, AnExceptionFromTheBodyIsLoggedAndTheProcessGoesOn) {
     lStandard.waitForExit();
     lOther.waitForExit();
   }
-  flushLogger();
-  const std::string lText = qntest::readFile(lLog);
-  destroyLogger();
+  const std::string lText = log();
   EXPECT_NE(std::string::npos, lText.find("-E-")) << lText;
   EXPECT_NE(std::string::npos, lText.find("Thread 'family' ended by an exception: sensor lost")) << lText;
   EXPECT_NE(std::string::npos, lText.find("Thread 'standard' ended by an exception: bus error")) << lText;

@@ -47,4 +47,17 @@ size_t find(const std::string& acrHaystack, const std::string& acrText, size_t a
 // The path of a program built beside the tests (relative to the build directory).
 std::string builtProgram(const std::string& acrRelativePath);
 
+// The message of the exception E that acrCall throws, followed by " (code N)" when aWithCode;
+// "(nothing thrown)" when the call returns. An exception of another class passes through.
+template <class E, class Call>
+std::string thrown(const Call& acrCall, bool aWithCode = false) {
+  try {
+    acrCall();
+  } catch (const E& acrException) {
+    const std::string lMessage = acrException.what();
+    return aWithCode ? lMessage + " (code " + std::to_string(acrException.getCode()) + ")" : lMessage;
+  }
+  return "(nothing thrown)";
+}
+
 }  // namespace qntest
