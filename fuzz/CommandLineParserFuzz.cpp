@@ -9,7 +9,7 @@
 //   one of the documented forms, leaves the state "failed" and keeps no argument;
 // - after success, for every option of the table getArgument() either finds it or throws
 //   QNCNotFoundEx; a found value-taking option is a QNCOptionValueArgument holding the word that
-//   followed the option, a found flag is not; the options found with their values account for
+//   followed the option (never itself an option), a found flag is not; the options found with their values account for
 //   every word of the line exactly once;
 // - a second run() over the same line ends the same way.
 
@@ -45,6 +45,13 @@ std::vector<std::string> words(const std::string& acrLine) {
   }
   if (!lWord.empty()) lWords.push_back(lWord);
   return lWords;
+}
+
+bool isOption(const std::string& acrWord) {
+  for (const QNSCommandLineArgumentDesc& lrDesc : kOptions) {
+    if (acrWord == lrDesc.mOption) return true;
+  }
+  return false;
 }
 
 bool isDocumentedRejection(const char* apMessage) {
@@ -102,6 +109,7 @@ void checkParsed(QNCCommandLineParser& arParser, const std::vector<std::string>&
       QN_FUZZ_CHECK(lpValue != nullptr);
       QN_FUZZ_CHECK(lAt + 1 < acrWords.size());
       QN_FUZZ_CHECK(acrWords[lAt + 1] == lpValue->getValue().get());
+      QN_FUZZ_CHECK(!isOption(lpValue->getValue().get()));  // an option is never taken as a value
       lAccounted += 2;
     } else {
       QN_FUZZ_CHECK(lpValue == nullptr);
