@@ -65,7 +65,11 @@ int main(int argc, char** argv) {
       return 1;
     }
     fprintf(stderr, "running %s (%zu bytes)\n", lrInput.c_str(), lBytes.size());
-    LLVMFuzzerTestOneInput(reinterpret_cast<const uint8_t*>(lBytes.data()), lBytes.size());
+    // Like libFuzzer, never pass a null pointer, also for an empty input: the targets may hand it
+    // to functions that require one (strnlen).
+    static const uint8_t kNoBytes[1] = {0};
+    const uint8_t* lpData = lBytes.empty() ? kNoBytes : reinterpret_cast<const uint8_t*>(lBytes.data());
+    LLVMFuzzerTestOneInput(lpData, lBytes.size());
   }
   printf("%zu inputs ran without a fault\n", lInputs.size());
   return 0;
