@@ -6,14 +6,15 @@
 #include "Clib.h"
 #include "OsStream.h"
 
-QNCFdReader::QNCFdReader(int aFd, bool aOwnsFd, unsigned int aStagingSize)
+QNCFdReader::QNCFdReader(int aFd, bool aOwnsFd, unsigned int aStagingSize, unsigned int aReadWaitMs)
     : mFd(aFd),
       mOwnsFd(aOwnsFd),
       mpStaging(nullptr),
       mStagingSize(aStagingSize == 0 ? 1 : aStagingSize),
       mStagedBegin(0),
       mStagedEnd(0),
-      mEnded(false) {
+      mEnded(false),
+      mReadWaitMs(aReadWaitMs) {
   mpStaging = new (std::nothrow) unsigned char[mStagingSize];
   if (mpStaging == nullptr) throw QNCNoMemoryEx("Out of Memory", 2);
   try {
@@ -42,14 +43,17 @@ void QNCFdReader::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) {
   arCount = 0;
   if (lWanted == 0) return;
   if (mStagedBegin == mStagedEnd) {
+    if (mEnded) return;  // end of the stream, seen before
+    // Waiting here, under the lock, is what a read wait asks for: this thread wants these bytes.
+    if (mReadWaitMs != 0) (void)OsWaitReadable(mFd, mReadWaitMs);
     if (lWanted >= mStagingSize) {
       // A large read gains nothing from staging: read straight into the caller's buffer.
       const long lRead = OsReadSome(mFd, lpTarget, lWanted);
       if (lRead < 0) throw QNCTryAgainEx("Resource temporarily unavailable", 11);
+      mEnded = lRead == 0;
       arCount = static_cast<unsigned int>(lRead);
       return;
     }
-    if (mEnded) return;  // end of the stream, seen before
     const long lRead = OsReadSome(mFd, mpStaging, mStagingSize);
     if (lRead < 0) throw QNCTryAgainEx("Resource temporarily unavailable", 11);
     if (lRead == 0) {
@@ -64,6 +68,14 @@ void QNCFdReader::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) {
   ClibMemcpy(lpTarget, mpStaging + mStagedBegin, lDelivered);
   mStagedBegin += lDelivered;
   arCount = lDelivered;
+  // The staging buffer is empty and much is still wanted: take what is already there straight
+  // into the caller's buffer rather than through another round of staging.
+  const unsigned int lRest = lWanted - lDelivered;
+  if (lRest >= mStagingSize && !mEnded) {
+    const long lRead = OsReadSome(mFd, lpTarget + lDelivered, lRest);
+    if (lRead > 0) arCount += static_cast<unsigned int>(lRead);
+    mEnded = lRead == 0;
+  }
 }
 
 bool QNCFdReader::atEndOfStream() {

@@ -5,7 +5,7 @@
 #include "OsStream.h"
 
 QNCFdWriter::QNCFdWriter(int aFd, bool aOwnsFd, unsigned int aTimeoutMs)
-    : mFd(aFd), mOwnsFd(aOwnsFd), mTimeoutMs(aTimeoutMs) {
+    : mFd(aFd), mOwnsFd(aOwnsFd), mIsSocket(OsIsSocket(aFd)), mTimeoutMs(aTimeoutMs) {
   OsDisableNagleIfTcp(mFd);
 }
 
@@ -25,6 +25,6 @@ void QNCFdWriter::write(const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& ar
   const unsigned char* lpBytes = lBuffer;
   const unsigned int lLength = lBuffer.getLength();
   arCount = 0;
-  OsWriteAll(mFd, lpBytes, lLength, mTimeoutMs);
+  OsWriteAll(mFd, mIsSocket, lpBytes, lLength, mTimeoutMs);
   arCount = lLength;
 }

@@ -84,7 +84,7 @@ void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) 
   std::unique_lock<std::mutex> lGuard(mLock);
   if (mState != QNSS_Open) {
     if (mState == QNSS_Memory) mStartup.keep(aLevel, apLine, aLength);
-    lGuard.unlock();
+    // Under the lock, so that urgent lines of several threads reach standard error whole.
     if (lUrgent) writeAll(STDERR_FILENO, apLine, aLength);
     return;
   }
@@ -99,14 +99,11 @@ void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) 
   mUsed += aLength;
   const bool lWriteNow = lUrgent || mWriteThrough;
   const bool lWakeFlusher = lWasEmpty && mFlusherRunning;
-  const bool lNeedFlusher = !mFlusherRunning && !mWriteThrough;
   lGuard.unlock();
   if (lWriteNow) {
     _writeBatch();
   } else if (lWakeFlusher) {
     mFlusherWake.notify_all();
-  } else if (lNeedFlusher) {
-    _startFlusher();  // a child forked after CreateLogger: its first line starts its flusher
   }
 }
 
@@ -257,8 +254,13 @@ void QNCLogSink::__forkChild() {
   QNCLogSink& lrSink = instance();
   // The parent writes its own buffered lines; the child writing them too would double them.
   // Lines kept in memory before the log is open are the child's to keep (daemonizing).
-  if (lrSink.mState == QNSS_Open) lrSink.mUsed = 0;
-  lrSink.mFlusherRunning = false;  // the parent's flusher does not exist here
+  // The parent's flusher does not exist here, and a thread started in the child of a
+  // multi-threaded process is unsafe until exec: the child writes each line at once instead.
+  if (lrSink.mState == QNSS_Open) {
+    lrSink.mUsed = 0;
+    lrSink.mWriteThrough = true;
+  }
+  lrSink.mFlusherRunning = false;
   lrSink.mStopFlusher = false;
   lrSink.mLock.unlock();
   lrSink.mWriteLock.unlock();

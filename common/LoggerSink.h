@@ -66,7 +66,7 @@ class QNCLogSink {
   int mFd = -1;
   char* mpActive;
   size_t mUsed = 0;
-  bool mWriteThrough = false;    // after the exit handler: every line is written at once
+  bool mWriteThrough = false;    // after the exit handler, in a child of fork: lines written at once
   bool mFlusherRunning = false;  // a flusher thread exists in this process
   bool mStopFlusher = false;
   pthread_t mFlusher{};

@@ -127,11 +127,14 @@ void QNCBufferManager::reuse(QNCPointer<QNCBuffer>& arBuffer) {
   }
   QNCMutex& lMutex = *mBufferQueueMutexes[lIndex];
   QNCBufferQueue& lQueue = *mBufferQueues[lIndex];
+  // The queue's own reference, taken before the lock so that its counter update does not
+  // lengthen the locked section; should the enqueue fail it is dropped after the unlock.
+  QNCPointer<QNCBuffer> lQueued(arBuffer);
   QN_LOG_TRACE("Locking bucket # %u", lIndex);
   lMutex.lock();
   QN_LOG_TRACE("Queuing buffer to be reused in bucket # %u", lIndex);
   try {
-    lQueue.enqueue(arBuffer);
+    lQueue.enqueue(std::move(lQueued));
   } catch (QNCException&) {
     lMutex.unlock();
     throw;

@@ -49,9 +49,8 @@ void QNCProtocolHelper::read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuff
     QN_LEFT();
     return;
   }
-  QNCPointer<QNCBuffer> lChunk = newBuffer(lreadsize);
   QNCPointer<QNCBuffer> lMessage = newBuffer(lreadsize);
-  __gather(arReader, lChunk, *lMessage, lreadsize);
+  __gather(arReader, lMessage, lreadsize);
   arBuffer = lMessage;
   QN_LEFT();
 }
@@ -67,34 +66,47 @@ void QNCProtocolHelper::write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<
 void QNCProtocolHelper::__readSize(QNCPointer<QNCReader>& arReader, unsigned int& arSize) {
   QN_ENTERED();
   QNCPointer<QNCBuffer> lPrefix = newBuffer(sizeof arSize);
-  unsigned char lBytes[sizeof arSize];
-  __gather(arReader, lPrefix, lBytes, sizeof arSize);
-  ClibMemcpy(&arSize, lBytes, sizeof arSize);
+  __gather(arReader, lPrefix, sizeof arSize);
+  const QNCBuffer& lBytes = *lPrefix;
+  ClibMemcpy(&arSize, static_cast<const unsigned char*>(lBytes), sizeof arSize);
   QN_LOG_TRACE("Protocol Message to read is of '%u' bytes", arSize);
   QN_LEFT();
 }
 
-void QNCProtocolHelper::__gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arChunk,
-                                 unsigned char* apTarget, unsigned int acTotal) {
+void QNCProtocolHelper::__gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arTarget,
+                                 unsigned int acTotal) {
+  // The first read goes straight into the target; a chunk buffer is made only when a read comes
+  // up short, and its bytes are copied into place. Every read is offered exactly the missing
+  // length either way.
+  unsigned char* lpTarget = *arTarget;
+  QNCPointer<QNCBuffer> lChunk = arTarget;
   unsigned int lReadbynow = 0;
   unsigned int lcountsize = 0;
   while (acTotal > lReadbynow) {
     const unsigned int lMissing = acTotal - lReadbynow;
-    // A reader may have put a smaller buffer of its own into the chunk pointer.
-    if (arChunk->getCapacity() < lMissing) arChunk = newBuffer(lMissing);
-    arChunk->setLength(lMissing);
-    __readActual(arReader, lcountsize, arChunk);
+    if (lReadbynow != 0 && (lChunk.get() == arTarget.get() || lChunk->getCapacity() < lMissing)) {
+      lChunk = newBuffer(lMissing);
+    }
+    lChunk->setLength(lMissing);
+    QNCBuffer* const lpOffered = lChunk.get();
+    __readActual(arReader, lcountsize, lChunk);
     QN_LOG_TRACE("lReadbynow = %u, lcountsize = %u lreadsize = %u", lReadbynow, lcountsize, acTotal);
     if (lcountsize == 0 || lcountsize > lMissing) {
       QN_LOG_ERROR("Failed in reading %u read %u", acTotal, lReadbynow);
       throw QNCReadFailedEx("Failed in reading the chunk", kReadFailedCode);
     }
-    const QNCBuffer& lChunk = *arChunk;
-    ClibMemcpy(apTarget + lReadbynow, static_cast<const unsigned char*>(lChunk), lcountsize);
+    // Bytes that did not land in place -- read into a chunk, or into a buffer of the reader's
+    // own that it put into the pointer -- are copied there.
+    const QNCBuffer& lDelivered = *lChunk;
+    const unsigned char* lpDelivered = lDelivered;
+    if (lpDelivered != lpTarget + lReadbynow || lChunk.get() != lpOffered) {
+      ClibMemcpy(lpTarget + lReadbynow, lpDelivered, lcountsize);
+    }
     lReadbynow += lcountsize;
     QN_LOG_TRACE("Read %u bytes into localbuffer total read = %u", lcountsize, lReadbynow);
     lcountsize = 0;
   }
+  arTarget->setLength(acTotal);
 }
 
 void QNCProtocolHelper::__readActual(QNCPointer<QNCReader>& arReader, unsigned int& arCount,

@@ -1,5 +1,7 @@
 #include "Assert.h"
 #include "Conditional.h"
+#include "Logger.h"
+#include "QNException.h"
 #include "Reader.h"
 #include "System.h"
 #include "Writer.h"
@@ -14,9 +16,79 @@ QNCPointer<QNCWriter>& QNCSystem::getWriter(unsigned int acWriterNo) {
   return mWriters[acWriterNo];
 }
 
-void QNCSystem::signal(unsigned int) {}
-void QNCSystem::wait(unsigned int) {}
-void QNCSystem::timedWait(unsigned int, unsigned int) {}
-void QNCSystem::send(unsigned int, const QNCPointer<QNCBuffer>&, unsigned int&) {}
-void QNCSystem::receive(unsigned int, QNCPointer<QNCBuffer>&, unsigned int&) {}
-void QNCSystem::waitForActivity(unsigned int, unsigned int) {}
+void QNCSystem::signal(unsigned int acConditionNo) {
+  QN_ENTERED();
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
+  // Signalling under the conditional's lock: a waiter that has found its queue or list empty
+  // still holds this lock until it is inside the wait, so the signal cannot fall between the
+  // waiter's test and its wait and be lost.
+  lConditional.lock();
+  lConditional.signal();
+  lConditional.unlock();
+  QN_LEFT();
+}
+
+void QNCSystem::wait(unsigned int acConditionNo) {
+  QN_ENTERED();
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
+  QN_LOG_TRACE("Locking the wait conditional");
+  lConditional.lock();
+  QN_LOG_TRACE("Going to wait on conditional");
+  try {
+    lConditional.wait();
+  } catch (...) {
+    // The wait holds the lock again when it fails; giving it up keeps the conditional usable.
+    QN_LOG_TRACE("Unlocking the wait conditional");
+    lConditional.unlock();
+    throw;
+  }
+  QN_LOG_TRACE("Unlocking the wait conditional");
+  lConditional.unlock();
+  QN_LEFT();
+}
+
+void QNCSystem::timedWait(unsigned int acConditionNo, unsigned int aWaitTime) {
+  QN_ENTERED();
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
+  QN_LOG_TRACE("Locking the wait conditional");
+  lConditional.lock();
+  QN_LOG_TRACE("Going to wait on conditional");
+  try {
+    lConditional.timedWait(aWaitTime);
+  } catch (...) {
+    // A time-out (QNCTimeOutEx) and any other failure of the wait come back with the lock
+    // held; it is given up before the exception leaves.
+    QN_LOG_TRACE("Unlocking the wait conditional");
+    lConditional.unlock();
+    throw;
+  }
+  QN_LOG_TRACE("Unlocking the wait conditional");
+  lConditional.unlock();
+  QN_LEFT();
+}
+
+void QNCSystem::send(unsigned int acWriterNo, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount) {
+  QN_ENTERED();
+  QN_ASSERT(acWriterNo < this->mWriters.numberOfElements());
+  mWriters[acWriterNo]->write(acrBuffer, arCount);
+  QN_LEFT();
+}
+
+void QNCSystem::receive(unsigned int acReaderNo, QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) {
+  QN_ENTERED();
+  QN_ASSERT(acReaderNo < this->mReaders.numberOfElements());
+  mReaders[acReaderNo]->read(arBuffer, arCount);
+  QN_LEFT();
+}
+
+void QNCSystem::waitForActivity(unsigned int acReaderNo, unsigned int acWaitTime) {
+  QN_ENTERED();
+  QN_ASSERT(acReaderNo < this->mReaders.numberOfElements());
+  QN_ASSERT(acWaitTime > 0);
+  // Whether data arrived or the time passed is the reader's answer; callers find out by reading.
+  (void)mReaders[acReaderNo]->waitForActivity(acWaitTime);
+  QN_LEFT();
+}

@@ -1,5 +1,6 @@
 #include "SystemGlobals.h"
 
+#include <atomic>
 #include <cstdlib>
 #include <mutex>
 
@@ -12,16 +13,21 @@
 #include "System.h"
 
 namespace {
-// Guards gspSystem against the signal handlers, which run on the dispatcher thread: SysExit
-// clears the pointer under it before destroying the object, so no handler reaches an object
-// being destroyed. The main thread writes gspSystem only before handlers exist and in SysExit.
-std::mutex gsSystemLock;
-QNCSystem* gspSystem = nullptr;
+// The registered object. Any thread may read it (getSystemObject, the handlers on the signal
+// dispatcher thread); the main thread writes it before the handlers exist and in SysExit. Atomic,
+// so that reading it needs no lock.
+std::atomic<QNCSystem*> gspSystem{nullptr};
+// Keeps SysExit from destroying the object while a handler is inside makeThreadsToExit: SysExit
+// clears gspSystem under it before the destruction begins, so a later handler finds no object.
+// It is never taken by getSystemObject: the application's threads, and its own makeThreadsToExit,
+// look the object up while an exit request is being handled, and would deadlock on it.
+std::mutex gsExitRequestLock;
 char gsLogFilePath[512] = {0};
 
 void requestExit() {
-  std::lock_guard<std::mutex> lGuard(gsSystemLock);
-  if (gspSystem != nullptr) gspSystem->makeThreadsToExit();
+  std::lock_guard<std::mutex> lGuard(gsExitRequestLock);
+  QNCSystem* lpSystem = gspSystem.load();
+  if (lpSystem != nullptr) lpSystem->makeThreadsToExit();
 }
 
 void handleSigInt(int) { requestExit(); }
@@ -31,14 +37,10 @@ void handleSigHup(int) { requestExit(); }
 
 void setSystemObject(QNCSystem* apSystem) {
   QN_ASSERT(0UL != apSystem);
-  std::lock_guard<std::mutex> lGuard(gsSystemLock);
-  gspSystem = apSystem;
+  gspSystem.store(apSystem);
 }
 
-void getSystemObject(QNCSystem*& arpSystem) {
-  std::lock_guard<std::mutex> lGuard(gsSystemLock);
-  arpSystem = gspSystem;
-}
+void getSystemObject(QNCSystem*& arpSystem) { arpSystem = gspSystem.load(); }
 
 void setLogFilePath(char const* apFileName) {
   QN_ENTERED();
@@ -63,49 +65,49 @@ void getLogDir(QNCString& arDir) {
 void SysInit(int argc, char** argv) {
   QN_ENTERED();
   QN_ASSERT(0 != gspSystem);
+  QNCSystem* const lpSystem = gspSystem.load();
   QNCString lLogFilePath("");
-  gspSystem->preInit();
-  gspSystem->processCommandLine(argc, argv);
-  QNCString lConfFilePath(gspSystem->getConfFilePathStr());
+  lpSystem->preInit();
+  lpSystem->processCommandLine(argc, argv);
+  QNCString lConfFilePath(lpSystem->getConfFilePathStr());
   try {
-    gspSystem->parseConfigFile(lConfFilePath);
+    lpSystem->parseConfigFile(lConfFilePath);
   } catch (QNCNotImplementedEx&) {
     QN_LOG_ERROR("Config file parsing not implemented.");
   }
-  gspSystem->applySettings();
+  lpSystem->applySettings();
   getLogFilePath(lLogFilePath);
   QN_LOG_TRACE("Creating the logger");
   CreateLogger(lLogFilePath);
-  gspSystem->markAsRunning();
+  lpSystem->markAsRunning();
   QN_LOG_TRACE("Initializing the system data");
-  gspSystem->init();
+  lpSystem->init();
   QN_LOG_TRACE("Creating the threads");
-  gspSystem->createThreads();
-  gspSystem->startThreads();
-  gspSystem->postThreadsInit();
+  lpSystem->createThreads();
+  lpSystem->startThreads();
+  lpSystem->postThreadsInit();
   RegisterSignalHandler(2, handleSigInt);
   RegisterSignalHandler(15, handleSigTerm);
   RegisterSignalHandler(1, handleSigHup);
-  gspSystem->createStartUpEvent();
+  lpSystem->createStartUpEvent();
   QN_LEFT();
 }
 
 void SysExit() {
   QN_ENTERED();
   QN_ASSERT(0 != gspSystem);
+  QNCSystem* const lpSystem = gspSystem.load();
   QN_LOG_TRACE("Waiting for threads to exit...");
-  gspSystem->waitForThreads();
+  lpSystem->waitForThreads();
   QN_LOG_INFO("All threads have gracefully exited");
   QN_LOG_TRACE("Going to unmark itself as singleton running process");
-  gspSystem->exitInstanceManagement();
+  lpSystem->exitInstanceManagement();
   QN_LOG_INFO("Destroying System");
-  gspSystem->destroy();
-  gspSystem->postDestroy();
-  QNCSystem* lpSystem = nullptr;
+  lpSystem->destroy();
+  lpSystem->postDestroy();
   {
-    std::lock_guard<std::mutex> lGuard(gsSystemLock);
-    lpSystem = gspSystem;
-    gspSystem = nullptr;
+    std::lock_guard<std::mutex> lGuard(gsExitRequestLock);
+    gspSystem.store(nullptr);
   }
   delete lpSystem;
   QN_LOG_INFO("Destroying the Logger. You won't see any more logs!");

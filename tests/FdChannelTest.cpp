@@ -8,6 +8,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <thread>
 #include <vector>
 
@@ -115,6 +116,27 @@ TEST(FdChannelTest, StagedBytesAreServedAcrossSmallReadsWithoutLoss) {
     lReceived.insert(lReceived.end(), lChunk.begin(), lChunk.begin() + lCount);
   }
   EXPECT_EQ(lSent, lReceived);
+  close(lPair[1]);
+}
+
+// With a read wait, bytes that arrive within it are delivered instead of QNCTryAgainEx, and an
+// idle stream still answers QNCTryAgainEx once the wait has passed.
+TEST(FdChannelTest, ReadWaitDeliversBytesThatArriveWithinIt) {
+  int lPair[2];
+  ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, lPair));
+  QNCFdReader lReader(lPair[0], true, QNCFdReader::kDefaultStagingSize, 5000);
+  std::thread lLate([&] {
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    ASSERT_EQ(3, write(lPair[1], "xyz", 3));
+  });
+  QNCPointer<QNCBuffer> lBuffer = bufferOf(Bytes(8));
+  unsigned int lCount = 0;
+  lReader.read(lBuffer, lCount);
+  lLate.join();
+  EXPECT_EQ(3u, lCount);
+
+  QNCFdReader lImpatient(lPair[1], false, QNCFdReader::kDefaultStagingSize, 20);
+  EXPECT_THROW(lImpatient.read(lBuffer, lCount), QNCTryAgainEx);
   close(lPair[1]);
 }
 

@@ -217,6 +217,23 @@ TEST_F(ProtocolHelperTest, PrefixAboveTheMaximumIsRefusedBeforeTheBodyIsRead) {
   EXPECT_EQ(100u, mResult->getLength());
 }
 
+// A reader may hand its bytes back in a buffer of its own instead of the one it was offered.
+TEST_F(ProtocolHelperTest, BytesInAReadersOwnBufferAreGatheredToo) {
+  class SwappingReader : public QNCReader {
+   public:
+    void read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) override {
+      const Bytes lPart = mCalls++ == 0 ? Bytes{6, 0, 0, 0} : sequence(3, static_cast<unsigned char>(mCalls * 10));
+      arBuffer = bufferOf(lPart);
+      arCount = static_cast<unsigned int>(lPart.size());
+    }
+    bool waitForActivity(unsigned int) override { return true; }
+    unsigned int mCalls = 0;
+  };
+  QNCPointer<QNCReader> lReader(new SwappingReader, QNPST_Individual, QNPAT_New);
+  mHelper.read(lReader, mResult, 0);
+  EXPECT_EQ((Bytes{20, 21, 22, 30, 31, 32}), bytesOf(mResult));
+}
+
 TEST_F(ProtocolHelperTest, ReaderExceptionsOtherThanTryAgainPassUnchanged) {
   class FailingReader : public QNCReader {
    public:

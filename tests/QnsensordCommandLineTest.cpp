@@ -53,7 +53,7 @@ class QnsensordCommandLineTest : public ::testing::Test {
         return WIFEXITED(lStatus) ? WEXITSTATUS(lStatus) : 128 + WTERMSIG(lStatus);
       }
       const std::string lLog = qntest::readFile(logPath());
-      if (lLog.size() > aLogBefore && contains(lLog.substr(aLogBefore), "Sample 1 processed")) break;
+      if (lLog.size() > aLogBefore && contains(lLog.substr(aLogBefore), "qnsensord running")) break;
       std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }
     kill(aPid, SIGTERM);
@@ -134,7 +134,7 @@ TEST_F(QnsensordCommandLineTest, ShutdownWithNothingRunningEndsWithStatusZero) {
 TEST_F(QnsensordCommandLineTest, NoArgumentsStartADaemonThatShutdownStops) {
   const QnsensordRun lStart = run({});
   EXPECT_EQ(0, lStart.mStatus) << "the starting process leaves once the daemon exists";
-  ASSERT_TRUE(qntest::waitForText(logPath(), "Sample 1 processed")) << qntest::readFile(logPath());
+  ASSERT_TRUE(qntest::waitForText(logPath(), "qnsensord running")) << qntest::readFile(logPath());
   const std::string lLog = qntest::readFile(logPath());
   EXPECT_TRUE(contains(lLog, "Running the current process in the background as daemon"));
   const pid_t lDaemon = initPid(lLog);

@@ -2,12 +2,14 @@
 // QNCFdReader: the receiving end of a buffer channel over a file descriptor (a connected
 // stream socket or the read end of a pipe).
 //
-// - The descriptor is put into non-blocking mode. read() never blocks: with nothing to deliver it
-//   throws QNCTryAgainEx; at the end of the stream it delivers 0 bytes; other failures are
+// - The descriptor is put into non-blocking mode. With nothing to deliver, read() throws
+//   QNCTryAgainEx at once -- or, when the reader was made with a read wait, after waiting at most
+//   that long for bytes (a body that trails its prefix by a moment then costs no retry sleep of
+//   the caller). At the end of the stream it delivers 0 bytes; other failures are
 //   QNCReadFailedEx naming the descriptor and the system's error text.
-// - Received bytes are staged: one large read(2) fills a staging buffer, and small reads (a size
-//   prefix, a short body) are served from memory. A read that wants at least the staging size and
-//   finds nothing staged goes straight into the caller's buffer.
+// - Received bytes are staged: one read(2) fills a staging buffer, and small reads (a size prefix,
+//   short bodies) are served from memory. A read that wants at least the staging size and finds
+//   nothing staged goes straight into the caller's buffer, so a large body is copied once.
 // - waitForActivity(ms) returns true at once when bytes are staged, else waits with poll(2).
 // - The descriptor is closed by the destructor when the reader owns it.
 //
@@ -19,11 +21,13 @@
 
 class QNCFdReader : public QNCReader {
  public:
-  static constexpr unsigned int kDefaultStagingSize = 64 * 1024;
+  static constexpr unsigned int kDefaultStagingSize = 4096;
 
+  // aReadWaitMs: how long read() may wait for bytes before it throws QNCTryAgainEx (0: never).
   // Throws QNCNoMemoryEx when the staging buffer cannot be allocated, QNCOsException when the
   // descriptor cannot be made non-blocking.
-  explicit QNCFdReader(int aFd, bool aOwnsFd = true, unsigned int aStagingSize = kDefaultStagingSize);
+  explicit QNCFdReader(int aFd, bool aOwnsFd = true, unsigned int aStagingSize = kDefaultStagingSize,
+                       unsigned int aReadWaitMs = 0);
   ~QNCFdReader() override;
   QNCFdReader(const QNCFdReader&) = delete;
   QNCFdReader& operator=(const QNCFdReader&) = delete;
@@ -48,4 +52,5 @@ class QNCFdReader : public QNCReader {
   unsigned int mStagedBegin;  // first staged byte not yet delivered
   unsigned int mStagedEnd;    // one past the last staged byte
   bool mEnded;                // read(2) has reported the end of the stream
+  unsigned int mReadWaitMs;
 };

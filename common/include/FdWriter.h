@@ -35,5 +35,6 @@ class QNCFdWriter : public QNCWriter {
   QNCMutex mLock;  // serialises write()
   int mFd;
   bool mOwnsFd;
+  bool mIsSocket;
   unsigned int mTimeoutMs;
 };

@@ -34,8 +34,8 @@
 //   logger stays as it was (still keeping lines in memory, or still writing the log already open).
 // - No thread of its own exists before CreateLogger, so a fork before it (daemonizing) loses
 //   nothing; the memory of the lines kept so far is inherited by the child. A child forked after
-//   CreateLogger drops the parent's unwritten lines (the parent writes them), appends its own to
-//   the same file, and starts its own flusher at its first line.
+//   CreateLogger drops the parent's unwritten lines (the parent writes them) and appends its own
+//   to the same file, each at once: it has no flusher thread, and starts none.
 
 #include <atomic>
 

@@ -10,7 +10,8 @@
 //   counter, after the object has been released.
 // - Copying and assigning share the object and never allocate. Copying or assigning FROM an empty
 //   pointer is a programming error and asserts. Moving is allowed from any pointer and leaves the
-//   source empty; it costs no counter traffic.
+//   source empty; it costs no counter traffic. The source of an assignment may be held by the
+//   object the assignment releases ("lHead = lHead->mNext").
 // - The last reference destroys the object as it was made: delete, delete[] or free().
 // - A QNCPointer<Base> can be made from a QNCPointer<Derived> of a single object; the two share the
 //   counter. Base needs a virtual destructor.
@@ -77,6 +78,10 @@ class QNCPointer {
         mReferenceCount(acrCopy.mReferenceCount),
         mSizeType(acrCopy.mSizeType),
         mAllocationType(acrCopy.mAllocationType) {
+    // The last reference may be this one, and delete through a base without a virtual
+    // destructor would skip the derived part.
+    static_assert(std::is_same<std::remove_cv_t<T>, std::remove_cv_t<U>>::value || std::has_virtual_destructor<T>::value,
+                  "a QNCPointer to a base class needs a virtual destructor in the base");
     QN_ASSERT(0 != acrCopy.mPointer);
     QN_ASSERT(0 != acrCopy.mReferenceCount);
     QN_ASSERT(QNPST_Individual == acrCopy.mSizeType);
@@ -100,24 +105,23 @@ class QNCPointer {
     QN_ASSERT(0 != acrCopy.mPointer);
     QN_ASSERT(0 != acrCopy.mReferenceCount);
     if (this == &acrCopy) return *this;
-    // Take the new reference first: when both share the object, releasing first could destroy it.
+    // The source may live inside the object that this pointer releases ("lHead = lHead->mNext"),
+    // so its fields are read and its reference taken before the release. Taking the reference
+    // first also keeps the object alive when both pointers already share it.
     acrCopy.mReferenceCount->increment();
-    _release();
-    mPointer = acrCopy.mPointer;
-    mReferenceCount = acrCopy.mReferenceCount;
-    mSizeType = acrCopy.mSizeType;
-    mAllocationType = acrCopy.mAllocationType;
+    _replaceWith(acrCopy.mPointer, acrCopy.mReferenceCount, acrCopy.mSizeType, acrCopy.mAllocationType);
     return *this;
   }
 
   QNCPointer& operator=(QNCPointer&& arOther) noexcept {
     if (this == &arOther) return *this;
-    _release();
-    mPointer = arOther.mPointer;
-    mReferenceCount = arOther.mReferenceCount;
-    mSizeType = arOther.mSizeType;
-    mAllocationType = arOther.mAllocationType;
+    T* const lpPointer = arOther.mPointer;
+    QNCReferenceCount* const lpReferenceCount = arOther.mReferenceCount;
+    const unsigned char lSizeType = arOther.mSizeType;
+    const unsigned char lAllocationType = arOther.mAllocationType;
+    // Emptied before the release, which may destroy the object that holds arOther.
     arOther._clear();
+    _replaceWith(lpPointer, lpReferenceCount, lSizeType, lAllocationType);
     return *this;
   }
 
@@ -151,6 +155,17 @@ class QNCPointer {
  private:
   template <class U>
   friend class QNCPointer;
+
+  // Releases this reference and takes over the given fields, whose reference is already counted.
+  // The arguments are values, so they stay valid when the release destroys their origin.
+  void _replaceWith(T* apPointer, QNCReferenceCount* apReferenceCount, unsigned char aSizeType,
+                    unsigned char aAllocationType) noexcept {
+    _release();
+    mPointer = apPointer;
+    mReferenceCount = apReferenceCount;
+    mSizeType = aSizeType;
+    mAllocationType = aAllocationType;
+  }
 
   void _clear() noexcept {
     mPointer = nullptr;

@@ -13,6 +13,7 @@
 //
 // Threads: one thread at a time (callers lock).
 
+#include <new>
 #include <type_traits>
 #include <utility>
 
@@ -24,13 +25,31 @@ class QNCQueue {
   void enqueue(const T& acrElement) {
     if constexpr (kRecycles) {
       if (!mSpare.isEmpty()) {
-        // Copy first: should the copy throw, both lists are unchanged.
-        *mSpare.begin() = acrElement;
+        // Copy first: should the copy throw, both lists are unchanged. A copy that runs out of
+        // memory fails as a fresh node would.
+        try {
+          *mSpare.begin() = acrElement;
+        } catch (const std::bad_alloc&) {
+          throw QNCNoMemoryEx("Out of Memory", 2);
+        }
         mList.spliceBack(mSpare, mSpare.begin());
         return;
       }
     }
     mList.pushBack(acrElement);
+  }
+
+  // The same, moving the element in: a caller that made its copy before taking its lock keeps
+  // the copy's cost out of the locked section.
+  void enqueue(T&& arElement) {
+    if constexpr (kRecycles) {
+      if (!mSpare.isEmpty()) {
+        *mSpare.begin() = std::move(arElement);
+        mList.spliceBack(mSpare, mSpare.begin());
+        return;
+      }
+    }
+    mList.pushBack(arElement);
   }
 
   T dequeue() {
@@ -40,9 +59,13 @@ class QNCQueue {
       mSpare.spliceBack(mList, mList.begin());
       return lHead;
     } else {
-      T lHead = mList.front();
-      mList.popFront();
-      return lHead;
+      try {
+        T lHead = mList.front();
+        mList.popFront();
+        return lHead;
+      } catch (const std::bad_alloc&) {
+        throw QNCNoMemoryEx("Out of Memory", 2);
+      }
     }
   }
 

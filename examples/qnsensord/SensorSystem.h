@@ -12,6 +12,8 @@
 #include <cstdio>
 
 #include "QNException.h"
+#include "SensorChannel.h"
+#include "SensorStatistics.h"
 #include "System.h"
 
 // A command line that qnsensord cannot run with (unknown option, missing or bad value). main
@@ -21,6 +23,7 @@ QN_DECLARE_EXCEPTION(QNCUsageEx, public virtual QNCInvalidEx);
 class QNCSensorSystem : public QNCSystem {
  public:
   QNCSensorSystem();
+  ~QNCSensorSystem() override;
 
   // The base processing, then "-n". Every QNCInvalidEx of the command line (the parser's, a
   // bad -n) leaves as QNCUsageEx with the same message.
@@ -31,8 +34,23 @@ class QNCSensorSystem : public QNCSystem {
   // QNCNotFoundEx for a required key that is missing, QNCOpenFailedEx for a missing file.
   void parseConfigFile(QNCString& arConfFilePath) override;
   void displayHelp() override;
-  // One sampler thread and the pool that processes its samples (SensorThreads.cpp).
+  // The base, then one channel per ChannelCount (a Unix-domain socket qnsensord.<n>.sock in the
+  // log directory) as reader and writer n, conditional 0 and list 0 (SensorThreads.cpp).
+  void init() override;
+  // One ChannelWorker per channel, the ReadingConsumer, and the Reporters pool.
   void createThreads() override;
+  // The base, then the per-sensor statistics at notice level.
+  void destroy() override;
+  // Logs "qnsensord running" at notice level: start-up is complete and SIGINT, SIGTERM and SIGHUP
+  // now end the service in order (before this line they have their default effect).
+  void createStartUpEvent() override;
+
+  // Blocks until list kReadingList holds a reading (true) or the process is marked for exit and
+  // the list is empty (false).
+  bool waitForReadings();
+
+  static constexpr unsigned int kReadingsReady = 0;  // the conditional the consumer waits on
+  static constexpr unsigned int kReadingList = 0;    // the list of readings to answer
 
   // The one-line synopsis of the options, followed by a line end.
   static void printUsage(FILE* apStream);
@@ -42,4 +60,7 @@ class QNCSensorSystem : public QNCSystem {
 
  private:
   void _addChannelCount(unsigned int aCount);
+
+  QNCVector<QNCPointer<QNCSensorChannel>> mChannels;
+  QNCSensorStatistics mStatistics;
 };

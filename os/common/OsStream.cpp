@@ -27,12 +27,6 @@ long long nowMs() {
   return static_cast<long long>(lNow.tv_sec) * 1000 + lNow.tv_nsec / 1000000;
 }
 
-bool isSocket(int aFd) {
-  int lType = 0;
-  socklen_t lLength = sizeof lType;
-  return getsockopt(aFd, SOL_SOCKET, SO_TYPE, &lType, &lLength) == 0;
-}
-
 // write(2) to a descriptor that is not a socket raises SIGPIPE when the reader has gone. The
 // signal is blocked in this thread for the call and a SIGPIPE the call raised is consumed, so the
 // failure arrives as EPIPE only; a SIGPIPE that was already pending for another reason stays.
@@ -62,6 +56,12 @@ long writeSome(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCou
 }
 }  // namespace
 
+bool OsIsSocket(int aFd) {
+  int lType = 0;
+  socklen_t lLength = sizeof lType;
+  return getsockopt(aFd, SOL_SOCKET, SO_TYPE, &lType, &lLength) == 0;
+}
+
 void OsSetNonBlocking(int aFd) {
   const int lFlags = fcntl(aFd, F_GETFL);
   if (lFlags < 0 || fcntl(aFd, F_SETFL, lFlags | O_NONBLOCK) != 0)
@@ -78,13 +78,12 @@ long OsReadSome(int aFd, void* apBuffer, unsigned long aCount) {
   }
 }
 
-void OsWriteAll(int aFd, const void* apBuffer, unsigned long aCount, unsigned int aTimeoutMs) {
-  const bool lIsSocket = isSocket(aFd);
+void OsWriteAll(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCount, unsigned int aTimeoutMs) {
   const char* lpBytes = static_cast<const char*>(apBuffer);
   const long long lDeadline = nowMs() + aTimeoutMs;
   unsigned long lWritten = 0;
   while (lWritten < aCount) {
-    const long lResult = writeSome(aFd, lIsSocket, lpBytes + lWritten, aCount - lWritten);
+    const long lResult = writeSome(aFd, aIsSocket, lpBytes + lWritten, aCount - lWritten);
     if (lResult > 0) {
       lWritten += static_cast<unsigned long>(lResult);
       continue;

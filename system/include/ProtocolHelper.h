@@ -57,9 +57,9 @@ class QNCProtocolHelper {
   void __read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
   void __writeSize(QNCPointer<QNCWriter>& arWriter, unsigned int aSize);
   void __writeActual(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer);
-  // Gathers acTotal bytes into apTarget through chunk reads of exactly the missing length.
-  void __gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arChunk, unsigned char* apTarget,
-                unsigned int acTotal);
+  // Gathers acTotal bytes into arTarget (capacity at least acTotal) through reads offered exactly
+  // the missing length.
+  void __gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arTarget, unsigned int acTotal);
 
   const unsigned int mRetrySleepTime;
   const unsigned int mMaxMessageSize;

@@ -1,7 +1,64 @@
 #pragma once
-// QNCSynchList (declared here; its contract is completed with its implementation).
+// QNCSynchList: a doubly linked list of shared objects that any number of threads may change at
+// the same time. A plain class: the system object's list services (QNCSystem::enlist, delist,
+// ...) delegate to the operations below.
+//
+// Locking: mMutex guards mList. Every element operation holds it for its own duration only and
+// never calls out while holding it: a new node is allocated before the lock is taken, and an
+// element that leaves the list is released after the lock is given up, so an element's
+// destructor may use this list again. Elements are handed out as new pointers that share the
+// object, so a caller may keep using a delisted object while others change the list.
+//
+// begin(), end() and erase() are for a walk of the list. begin() and end() take no lock; the
+// walker must make sure that no other thread changes the list until the walk is over (erase()
+// itself locks, so it is safe against isEmpty() and numberOfElements() of other threads).
+//
+// Destruction clears mList (releasing every element's pointer), then releases mMutex.
+
+#include "Mutex.h"
+#include "Pointer.h"
+#include "QNList.h"
+#include "Queueable.h"
 
 class QNCSynchList {
  public:
-  virtual ~QNCSynchList() = default;
+  using Elements = QNCList<QNCPointer<QNCQueueable>>;
+
+  // Throws QNCNoMemoryEx "Out of Memory" (2) when the mutex cannot be allocated.
+  QNCSynchList();
+  QNCSynchList(const QNCSynchList&) = delete;
+  QNCSynchList& operator=(const QNCSynchList&) = delete;
+  ~QNCSynchList();
+
+  // Add acrElement at the tail / at the head. Throw QNCNoMemoryEx "Out of Memory" (2) when no
+  // node can be allocated; the list is then unchanged.
+  void enlist(const QNCPointer<QNCQueueable>& acrElement);
+  void enlistFront(const QNCPointer<QNCQueueable>& acrElement);
+
+  // Remove the head / the tail element and hand it to the caller. Throw QNCNotFoundEx
+  // "Not Found" (8) when the list is empty; the list is then unchanged and its lock released.
+  QNCPointer<QNCQueueable> delist();
+  QNCPointer<QNCQueueable> delistBack();
+
+  // A copy of the head element, made under the lock. Throws QNCNotFoundEx "Not Found" (8) when
+  // the list is empty.
+  QNCPointer<QNCQueueable> front();
+
+  // Removes every element.
+  void clear();
+  unsigned int numberOfElements();
+  bool isEmpty();
+
+  // Removes the element at arPosition, which must designate an element of this list, and moves
+  // arPosition to the element after it (end() after the last one).
+  void erase(Elements::iterator& arPosition);
+
+  Elements::iterator begin() { return mList.begin(); }
+  Elements::iterator end() { return mList.end(); }
+  Elements::const_iterator begin() const { return mList.begin(); }
+  Elements::const_iterator end() const { return mList.end(); }
+
+ private:
+  Elements mList;
+  QNCPointer<QNCMutex> mMutex;  // guards mList
 };

@@ -70,7 +70,11 @@ class QNCSystem : public QNCSystemInterface {
   // --- Numeric identifiers, serialised by mNidCreationLock. Available after init().
   void generateNumericId(unsigned int& arId) override;
 
-  // Wakes one thread waiting on conditional acConditionNo.
+  // Wakes one thread waiting on conditional acConditionNo; a signal while nobody waits is lost.
+  // Takes the conditional's lock for the signal, so it cannot fall between a waiter's emptiness
+  // test and its wait (see waitOnEmptyList): a producer's enlist/enqueue followed by signal()
+  // always wakes a waiter that found the list or queue empty. The caller must not hold that
+  // conditional's lock itself. Blocks only for the lock.
   void signal(unsigned int acConditionNo) override;
 
   // --- Host facts and the exit flag.
@@ -126,14 +130,38 @@ class QNCSystem : public QNCSystemInterface {
   virtual void makeThreadsToExit();
   virtual bool isInited(unsigned int aIndex) const;
 
-  // --- Numbered wait conditionals and buffer channels.
+  // --- Numbered wait conditionals and buffer channels. Numbers are asserted before any lock.
+  // wait(): one wait on conditional acConditionNo, returning after the first wake-up (a caller
+  // that needs a condition keeps it itself). timedWait(): the same, at most aWaitTime
+  // milliseconds on the monotonic clock; a time-out throws QNCTimeOutEx. Both release the
+  // conditional's lock before any exception leaves, so the conditional stays usable.
+  // Neither looks at the exit flag, and shut-down signals no conditional. A thread that must end
+  // on request waits in slices and checks the flag between them:
+  //   while (!isSetForExit()) {
+  //     if (isListEmpty(l)) {
+  //       try { timedWait(c, 1000); } catch (QNCTimeOutEx&) { continue; }
+  //     }
+  //     try { handle(delist(l)); } catch (QNCNotFoundEx&) {}  // another consumer was first
+  //   }
+  // A signal between isListEmpty() and timedWait() is not seen by that wait; it delays the
+  // element by at most one slice and never loses it, and the exit request by at most one slice.
   virtual void wait(unsigned int acConditionNo);
   virtual void timedWait(unsigned int acConditionNo, unsigned int aWaitTime);
+  // send/receive: write/read on writer/reader acWriterNo/acReaderNo (separate objects); no lock
+  // is taken, the channel's exceptions reach the caller. waitForActivity: the reader's own
+  // wait, at most acWaitTime milliseconds (asserted > 0); its answer is not passed on.
   virtual void send(unsigned int acWriterNo, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount);
   virtual void receive(unsigned int acReaderNo, QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
   virtual void waitForActivity(unsigned int acReaderNo, unsigned int acWaitTime);
 
-  // --- Numbered synchronised queues.
+  // --- Numbered synchronised queues (SynchQueue.h) and lists (SynchList.h). Every operation is
+  // safe from any thread; element order, exceptions and locking are the companion's.
+  // waitOnEmptyQueue/waitOnEmptyList: block without a time limit until queue/list n holds an
+  // element, testing it under conditional acConditionNo's lock and waiting on that conditional;
+  // return at once when it already holds one. They neither remove the element (another consumer
+  // may take it before the caller's dequeue/delist) nor look at the exit flag (see timedWait for
+  // a wait that ends on request). The conditional's lock is released before any exception leaves.
+  // enqueue/enlist/enlistFront signal nothing: the producer follows them with signal(c).
   virtual void waitOnEmptyQueue(unsigned int acConditionNo, unsigned int acQueueNo);
   virtual void enqueue(unsigned int acQueueNo, const QNCPointer<QNCQueueable>& acrElement);
   virtual QNCPointer<QNCQueueable> dequeue(unsigned int acQueueNo);
@@ -141,7 +169,8 @@ class QNCSystem : public QNCSystemInterface {
   virtual void queueClear(unsigned int acQueueNo);
   virtual bool isQueueEmpty(unsigned int acQueueNo);
 
-  // --- Numbered synchronised lists.
+  // listBegin/listEnd take no lock: the walker keeps other threads from changing the list until
+  // its walk (with listErase) is over.
   virtual void waitOnEmptyList(unsigned int acConditionNo, unsigned int acListNo);
   virtual void enlist(unsigned int acListNo, const QNCPointer<QNCQueueable>& acrElement);
   virtual void enlistFront(unsigned int acListNo, const QNCPointer<QNCQueueable>& acrElement);

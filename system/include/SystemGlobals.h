@@ -19,8 +19,9 @@
 // asynchronous signal context, so they may take the exit lock. A signal that arrives while
 // SysExit destroys the object finds no object: the pointer is cleared, under the same lock the
 // handlers take, before the destruction begins. After SysExit the handlers do nothing.
+// getSystemObject takes no lock: any thread may call it, also while an exit request is handled.
 //
-// Main thread only, except for the handlers.
+// Main thread only, except for the handlers and getSystemObject.
 
 class QNCString;
 class QNCSystem;

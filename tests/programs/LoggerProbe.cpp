@@ -8,6 +8,7 @@
 //   LoggerProbe badpath <log>        CreateLogger on a path that cannot be opened
 
 #include <signal.h>
+#include <sys/mman.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -70,8 +71,10 @@ int runExit(const char* apLog) {
 [[noreturn]] void crashBy(int aSignal) {
   switch (aSignal) {
     case SIGSEGV: {
-      volatile int* lpNowhere = nullptr;
-      *lpNowhere = 1;
+      // A real fault on a page without access (not a null pointer, which UBSan would catch first).
+      void* lpPage = mmap(nullptr, 4096, PROT_NONE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+      if (lpPage == MAP_FAILED) break;
+      *static_cast<volatile int*>(lpPage) = 1;
       break;
     }
     case SIGABRT:

@@ -9,10 +9,14 @@ void OsSetNonBlocking(int aFd);
 // -1 when nothing can be read now (EAGAIN). Throws QNCReadFailedEx for every other failure.
 long OsReadSome(int aFd, void* apBuffer, unsigned long aCount);
 
+// True when the descriptor is a socket (asked once per descriptor by its owner, not per write).
+bool OsIsSocket(int aFd);
+
 // Writes all aCount bytes, looping over partial writes. When the descriptor is non-blocking and
 // full, waits for it to drain, at most aTimeoutMs milliseconds in all (0: no limit). A peer that
 // has gone is QNCWriteFailedEx ("... Broken pipe"), never a SIGPIPE; a time-out is QNCTimeOutEx.
-void OsWriteAll(int aFd, const void* apBuffer, unsigned long aCount, unsigned int aTimeoutMs);
+// aIsSocket: what OsIsSocket said of aFd.
+void OsWriteAll(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCount, unsigned int aTimeoutMs);
 
 // Waits until the descriptor is readable, at the end of its stream, or in error (true), or
 // aTimeoutMs milliseconds have passed (false).

@@ -1,0 +1,164 @@
+// The driver's whole run in a real process (tests/programs/DriverApp.cpp): start-up order,
+// shut-down on each signal, repeated signals, signals after the run, and failing steps.
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+
+#include <string>
+#include <vector>
+
+#include "DeathTestSupport.h"
+#include "TestSupport.h"
+
+namespace {
+
+const std::vector<std::string> kStartUpSteps = {
+    "preInit",      "processCommandLine", "parseConfigFile", "applySettings",   "markAsRunning",
+    "init",         "createThreads",      "startThreads",    "postThreadsInit", "createStartUpEvent",
+};
+
+class DriverProcessTest : public ::testing::Test {
+ protected:
+  pid_t start(const std::vector<std::string>& acrArguments) {
+    std::vector<std::string> lArgv = {qntest::builtProgram("tests/driver_app")};
+    lArgv.insert(lArgv.end(), acrArguments.begin(), acrArguments.end());
+    return qntest::spawn(lArgv, {"QN_LOG_DIR=" + mDir.path()}, stdoutPath(), stderrPath());
+  }
+  pid_t startRunning(const std::vector<std::string>& acrArguments) {
+    const pid_t lPid = start(acrArguments);
+    if (!qntest::waitForText(stdoutPath(), "running\n")) {
+      ADD_FAILURE() << "the service never reached the running state; output:\n" << output();
+    }
+    return lPid;
+  }
+
+  std::string stdoutPath() const { return mDir.file("stdout"); }
+  std::string stderrPath() const { return mDir.file("stderr"); }
+  std::string output() const { return qntest::readFile(stdoutPath()); }
+  std::string errors() const { return qntest::readFile(stderrPath()); }
+  std::string log() const { return qntest::readFile(mDir.file("driver_app.log")); }
+
+  // Each text in order, every one after the previous one.
+  static void expectInOrder(const std::string& acrHaystack, const std::vector<std::string>& acrTexts) {
+    size_t lFrom = 0;
+    for (const auto& lText : acrTexts) {
+      const size_t lAt = acrHaystack.find(lText, lFrom);
+      ASSERT_NE(std::string::npos, lAt) << "\"" << lText << "\" missing or out of order in:\n" << acrHaystack;
+      lFrom = lAt + lText.size();
+    }
+  }
+
+  qntest::TempDir mDir;
+};
+
+class DriverSignalTest : public DriverProcessTest, public ::testing::WithParamInterface<int> {};
+
+TEST_P(DriverSignalTest, SignalShutsDownInOrder) {
+  const pid_t lPid = startRunning({"run"});
+  ASSERT_EQ(0, kill(lPid, GetParam()));
+  ASSERT_EQ(0, qntest::waitExit(lPid)) << output();
+
+  std::vector<std::string> lExpected;
+  for (const auto& lStep : kStartUpSteps) lExpected.push_back("step " + lStep);
+  lExpected.insert(lExpected.end(), {"step waitForThreads", "step makeThreadsToExit",
+                                     "All threads have gracefully exited", "step exitInstanceManagement",
+                                     "Destroying System", "step destroy", "step postDestroy", "step destructor",
+                                     "Destroying the Logger. You won't see any more logs!"});
+  const std::string lLog = log();
+  expectInOrder(lLog, lExpected);
+  EXPECT_EQ(std::string::npos, lLog.find("Config file parsing not implemented."));
+  EXPECT_NE(std::string::npos, output().find("exit request 1 self\n"))
+      << "the handler must reach the registered object, which must still be registered";
+  EXPECT_NE(std::string::npos, output().find("SystemMain returned\n"));
+}
+
+INSTANTIATE_TEST_SUITE_P(EachShutDownSignal, DriverSignalTest, ::testing::Values(SIGTERM, SIGINT, SIGHUP),
+                         [](const ::testing::TestParamInfo<int>& acrInfo) {
+                           return std::string(acrInfo.param == SIGTERM  ? "SIGTERM"
+                                              : acrInfo.param == SIGINT ? "SIGINT"
+                                                                        : "SIGHUP");
+                         });
+
+TEST_F(DriverProcessTest, DriverTraceLinesFallBetweenTheSteps) {
+  const pid_t lPid = startRunning({"run"});
+  ASSERT_EQ(0, kill(lPid, SIGTERM));
+  ASSERT_EQ(0, qntest::waitExit(lPid));
+  expectInOrder(log(), {"step applySettings", "Creating the logger", "step markAsRunning",
+                        "Initializing the system data", "step init", "Creating the threads", "step createThreads",
+                        "step createStartUpEvent", "Waiting for threads to exit...", "step waitForThreads",
+                        "All threads have gracefully exited", "Going to unmark itself as singleton running process",
+                        "step exitInstanceManagement"});
+}
+
+// Each SIGINT repeats the exit request; the service here ends only after the second one, so a
+// lost or ignored second request hangs it and the wait below fails.
+TEST_F(DriverProcessTest, TwoInterruptsRequestTwiceAndShutDownOnce) {
+  const pid_t lPid = startRunning({"run", "2"});
+  ASSERT_EQ(0, kill(lPid, SIGINT));
+  // Signals of one kind do not queue: the second is sent once the first has been handled.
+  ASSERT_TRUE(qntest::waitForText(stdoutPath(), "exit request 1 self\n")) << output();
+  ASSERT_EQ(0, kill(lPid, SIGINT));
+  ASSERT_EQ(0, qntest::waitExit(lPid)) << output();
+
+  EXPECT_NE(std::string::npos, output().find("exit request 2 self\n"));
+  const std::string lLog = log();
+  EXPECT_EQ(1u, qntest::countOf(lLog, "Destroying System"));
+  EXPECT_EQ(1u, qntest::countOf(lLog, "Destroying the Logger. You won't see any more logs!"));
+  EXPECT_EQ(1u, qntest::countOf(output(), "destructor\n"));
+}
+
+TEST_F(DriverProcessTest, SignalsAfterTheRunDoNotEndTheProcess) {
+  const pid_t lPid = startRunning({"linger"});
+  ASSERT_EQ(0, kill(lPid, SIGTERM));
+  ASSERT_TRUE(qntest::waitForText(stdoutPath(), "SystemMain returned\n")) << output();
+  for (const int lSignal : {SIGINT, SIGTERM, SIGHUP}) ASSERT_EQ(0, kill(lPid, lSignal));
+  EXPECT_EQ(0, qntest::waitExit(lPid)) << output();
+  EXPECT_NE(std::string::npos, output().find("lingered\n"));
+  EXPECT_EQ(1u, qntest::countOf(output(), "exit request")) << "a handler reached the destroyed object";
+}
+
+TEST_F(DriverProcessTest, MissingConfigFileParsingIsLoggedOnceAndStartUpGoesOn) {
+  const pid_t lPid = startRunning({"config-missing"});
+  ASSERT_EQ(0, kill(lPid, SIGTERM));
+  ASSERT_EQ(0, qntest::waitExit(lPid)) << output();
+  const std::string lLog = log();
+  ASSERT_EQ(1u, qntest::countOf(lLog, "Config file parsing not implemented.")) << lLog;
+  const size_t lAt = lLog.find("Config file parsing not implemented.");
+  const size_t lLineStart = lLog.rfind('\n', lAt) == std::string::npos ? 0 : lLog.rfind('\n', lAt) + 1;
+  EXPECT_NE(std::string::npos, lLog.substr(lLineStart, lAt - lLineStart).find("-E-"));
+  expectInOrder(lLog, {"step parseConfigFile", "Config file parsing not implemented.", "step applySettings",
+                       "step createStartUpEvent", "Destroying the Logger. You won't see any more logs!"});
+}
+
+TEST_F(DriverProcessTest, MainWithoutRegisteredObjectIsAnAssertion) {
+  const pid_t lPid = start({"unregistered"});
+  EXPECT_EQ(1, qntest::waitExit(lPid));
+  EXPECT_TRUE(qntest::assertionFailure("0 != gspSystem").Matches(errors())) << errors();
+  EXPECT_EQ("", output()) << "nothing may run without a registered object";
+}
+
+// Any exception but the tolerated one leaves SystemMain at once: later steps do not run and
+// SysExit does not run (it would wait for threads forever here, as nothing asks them to end).
+class DriverFailingStepTest : public DriverProcessTest, public ::testing::WithParamInterface<std::string> {};
+
+TEST_P(DriverFailingStepTest, ExceptionLeavesSystemMainWithoutShutDown) {
+  const std::string& lrStep = GetParam();
+  const pid_t lPid = start({"throw", lrStep});
+  ASSERT_EQ(3, qntest::waitExit(lPid)) << output();
+
+  std::string lExpected;
+  for (const auto& lStep : kStartUpSteps) {
+    lExpected += lStep + "\n";
+    if (lStep == lrStep) break;
+  }
+  lExpected += "SystemMain threw: injected failure in " + lrStep + "\n";
+  EXPECT_EQ(lExpected, output());
+  EXPECT_EQ(std::string::npos, log().find("All threads have gracefully exited"));
+}
+
+INSTANTIATE_TEST_SUITE_P(LifecycleSteps, DriverFailingStepTest,
+                         ::testing::Values("preInit", "processCommandLine", "parseConfigFile", "applySettings",
+                                           "markAsRunning", "init", "startThreads", "createStartUpEvent"));
+
+}  // namespace

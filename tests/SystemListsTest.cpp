@@ -1,0 +1,185 @@
+// The system object's numbered synchronised lists, used from one thread: element order, empty
+// lists, walks with listErase, and the lifetime of the objects that pass through.
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <vector>
+
+#include "Logger.h"
+#include "TableSystem.h"
+
+namespace {
+
+using qntest::idOf;
+using qntest::makeItem;
+
+class SystemListsTest : public ::testing::Test {
+ protected:
+  qntest::TableSystem mSystem{1, 0, 2};
+};
+
+std::vector<int> walk(const QNCSystem& acrSystem, unsigned int aList) {
+  std::vector<int> lIds;
+  for (auto lIt = acrSystem.listBegin(aList); lIt != acrSystem.listEnd(aList); ++lIt) lIds.push_back(idOf(*lIt));
+  return lIds;
+}
+
+TEST_F(SystemListsTest, EnlistFrontPutsAheadOfEarlierElements) {
+  mSystem.enlist(0, makeItem(1));
+  mSystem.enlist(0, makeItem(2));
+  mSystem.enlistFront(0, makeItem(3));
+  EXPECT_EQ(3, idOf(mSystem.listFront(0)));
+  EXPECT_EQ(3u, mSystem.listSize(0));  // listFront copies, it does not remove
+  EXPECT_EQ(3, idOf(mSystem.delist(0)));
+  EXPECT_EQ(1, idOf(mSystem.delist(0)));
+  EXPECT_EQ(2, idOf(mSystem.delist(0)));
+  EXPECT_TRUE(mSystem.isListEmpty(0));
+}
+
+TEST_F(SystemListsTest, DelistBackTakesFromTheTail) {
+  mSystem.enlist(0, makeItem(1));
+  mSystem.enlist(0, makeItem(2));
+  mSystem.enlistFront(0, makeItem(3));
+  EXPECT_EQ(2, idOf(mSystem.delistBack(0)));
+  EXPECT_EQ(1, idOf(mSystem.delistBack(0)));
+  EXPECT_EQ(3, idOf(mSystem.delistBack(0)));
+  EXPECT_EQ(0u, mSystem.listSize(0));
+}
+
+TEST_F(SystemListsTest, ListsWithDifferentNumbersAreIndependent) {
+  mSystem.enlist(0, makeItem(1));
+  mSystem.enlist(1, makeItem(2));
+  EXPECT_EQ(2, idOf(mSystem.delist(1)));
+  EXPECT_TRUE(mSystem.isListEmpty(1));
+  EXPECT_EQ(1u, mSystem.listSize(0));
+}
+
+// Each removal on an empty list must release the list's lock on its way out: the enlist that
+// follows would otherwise block for ever.
+TEST_F(SystemListsTest, RemovingFromEmptyListThrowsNotFoundAndLeavesItUsable) {
+  for (int lRound = 0; lRound < 3; ++lRound) {
+    try {
+      if (lRound == 0) mSystem.delist(0);
+      if (lRound == 1) mSystem.delistBack(0);
+      if (lRound == 2) mSystem.listFront(0);
+      ADD_FAILURE() << "no exception in round " << lRound;
+    } catch (const QNCNotFoundEx& acrException) {
+      EXPECT_STREQ("Not Found", acrException.what());
+      EXPECT_EQ(8u, acrException.getCode());
+    }
+    ASSERT_TRUE(qntest::returnsWithin([&] { mSystem.enlist(0, makeItem(lRound)); }, std::chrono::seconds(10)));
+    EXPECT_EQ(lRound, idOf(mSystem.delist(0)));
+  }
+}
+
+TEST_F(SystemListsTest, ClearEmptiesTheList) {
+  for (int lId = 0; lId < 3; ++lId) mSystem.enlist(0, makeItem(lId));
+  EXPECT_EQ(3u, mSystem.listSize(0));
+  EXPECT_FALSE(mSystem.isListEmpty(0));
+  mSystem.listClear(0);
+  EXPECT_EQ(0u, mSystem.listSize(0));
+  EXPECT_TRUE(mSystem.isListEmpty(0));
+  mSystem.enlist(0, makeItem(7));
+  EXPECT_EQ(7, idOf(mSystem.delist(0)));
+}
+
+TEST_F(SystemListsTest, EraseMovesTheIteratorToTheNextElement) {
+  mSystem.enlist(0, makeItem(1));
+  mSystem.enlist(0, makeItem(2));
+  auto lIt = mSystem.listBegin(0);
+  mSystem.listErase(0, lIt);
+  ASSERT_TRUE(lIt != mSystem.listEnd(0));
+  EXPECT_EQ(2, idOf(*lIt));
+  mSystem.listErase(0, lIt);
+  EXPECT_TRUE(lIt == mSystem.listEnd(0));
+  EXPECT_TRUE(mSystem.isListEmpty(0));
+}
+
+TEST_F(SystemListsTest, WalkThatErasesEveryOtherElementKeepsTheRestInOrder) {
+  for (int lId = 0; lId < 7; ++lId) mSystem.enlist(0, makeItem(lId));
+  for (auto lIt = mSystem.listBegin(0); lIt != mSystem.listEnd(0);) {
+    if (idOf(*lIt) % 2 == 0) {
+      mSystem.listErase(0, lIt);
+    } else {
+      ++lIt;
+    }
+  }
+  EXPECT_EQ((std::vector<int>{1, 3, 5}), walk(mSystem, 0));
+  EXPECT_EQ(3u, mSystem.listSize(0));
+}
+
+TEST_F(SystemListsTest, DelistedObjectLivesWhileHeldAndIsDestroyedExactlyOnce) {
+  std::atomic<int> lDestroyed{0};
+  mSystem.enlist(0, makeItem(1, &lDestroyed));  // the list is now the only holder
+  EXPECT_EQ(0, lDestroyed.load());
+  QNCPointer<QNCQueueable> lTaken = mSystem.delist(0);
+  QNCPointer<QNCQueueable> lShared = lTaken;
+  EXPECT_EQ(0, lDestroyed.load());
+  mSystem.enlist(0, makeItem(2));
+  mSystem.listClear(0);  // changing the list does not touch the delisted object
+  EXPECT_EQ(1, idOf(lShared));
+  lTaken.reset();
+  EXPECT_EQ(0, lDestroyed.load());
+  lShared.reset();
+  EXPECT_EQ(1, lDestroyed.load());
+}
+
+TEST_F(SystemListsTest, EveryWayOutOfTheListReleasesItsReferenceOnce) {
+  std::atomic<int> lDestroyed{0};
+  for (int lId = 0; lId < 6; ++lId) mSystem.enlist(0, makeItem(lId, &lDestroyed));
+  mSystem.delist(0);
+  mSystem.delistBack(0);
+  auto lIt = mSystem.listBegin(0);
+  mSystem.listErase(0, lIt);
+  EXPECT_EQ(3, lDestroyed.load());
+  mSystem.listClear(0);
+  EXPECT_EQ(6, lDestroyed.load());
+}
+
+// An element whose destructor uses the list it leaves: removing it must not hold the list's
+// lock while the element is destroyed, or the destructor would deadlock on it.
+class Reenlisting : public QNCQueueable {
+ public:
+  Reenlisting(QNCSystem& arSystem, std::atomic<int>& arDestroyed) : mSystem(arSystem), mDestroyed(arDestroyed) {}
+  ~Reenlisting() override {
+    mDestroyed.fetch_add(1);
+    mSystem.enlist(0, makeItem(99));
+  }
+
+ private:
+  QNCSystem& mSystem;
+  std::atomic<int>& mDestroyed;
+};
+
+TEST_F(SystemListsTest, ElementsAreDestroyedOutsideTheListLock) {
+  std::atomic<int> lDestroyed{0};
+  auto lReenlisting = [&] { return QNCPointer<QNCQueueable>(new (std::nothrow) Reenlisting(mSystem, lDestroyed)); };
+  const bool lReturned = qntest::returnsWithin(
+      [&] {
+        mSystem.enlist(0, lReenlisting());
+        mSystem.listClear(0);  // leaves the element added by the destructor
+        mSystem.delist(0);
+        mSystem.enlist(0, lReenlisting());
+        auto lIt = mSystem.listBegin(0);
+        mSystem.listErase(0, lIt);
+      },
+      std::chrono::seconds(10));
+  ASSERT_TRUE(lReturned);
+  EXPECT_EQ(2, lDestroyed.load());
+  EXPECT_EQ((std::vector<int>{99}), walk(mSystem, 0));
+}
+
+TEST(SynchListTest, DestructionReleasesTheElementsItHolds) {
+  std::atomic<int> lDestroyed{0};
+  QNCPointer<QNCQueueable> lKept = makeItem(1, &lDestroyed);
+  {
+    QNCSynchList lList;
+    lList.enlist(lKept);
+    lList.enlist(makeItem(2, &lDestroyed));
+  }
+  EXPECT_EQ(1, lDestroyed.load());
+  EXPECT_EQ(1, idOf(lKept));
+}
+
+}  // namespace

@@ -1,0 +1,94 @@
+// The system object's numbered synchronised queues, used from one thread.
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+
+#include "TableSystem.h"
+
+namespace {
+
+using qntest::idOf;
+using qntest::makeItem;
+
+class SystemQueuesTest : public ::testing::Test {
+ protected:
+  qntest::TableSystem mSystem{1, 2, 0};
+};
+
+TEST_F(SystemQueuesTest, ElementsLeaveInTheOrderTheyCame) {
+  for (int lId = 1; lId <= 3; ++lId) mSystem.enqueue(0, makeItem(lId));
+  EXPECT_EQ(1, idOf(mSystem.queueFront(0)));
+  EXPECT_EQ(1, idOf(mSystem.dequeue(0)));  // queueFront left the head in place
+  EXPECT_EQ(2, idOf(mSystem.dequeue(0)));
+  mSystem.enqueue(0, makeItem(4));
+  EXPECT_EQ(3, idOf(mSystem.dequeue(0)));
+  EXPECT_EQ(4, idOf(mSystem.dequeue(0)));
+  EXPECT_TRUE(mSystem.isQueueEmpty(0));
+}
+
+TEST_F(SystemQueuesTest, QueuesWithDifferentNumbersAreIndependent) {
+  mSystem.enqueue(1, makeItem(5));
+  EXPECT_TRUE(mSystem.isQueueEmpty(0));
+  EXPECT_FALSE(mSystem.isQueueEmpty(1));
+  EXPECT_EQ(5, idOf(mSystem.dequeue(1)));
+}
+
+TEST_F(SystemQueuesTest, TakingFromAnEmptyQueueThrowsNotFoundAndLeavesItUsable) {
+  for (int lRound = 0; lRound < 2; ++lRound) {
+    try {
+      if (lRound == 0) mSystem.dequeue(0);
+      if (lRound == 1) mSystem.queueFront(0);
+      ADD_FAILURE() << "no exception in round " << lRound;
+    } catch (const QNCNotFoundEx& acrException) {
+      EXPECT_STREQ("Not Found", acrException.what());
+      EXPECT_EQ(8u, acrException.getCode());
+    }
+    ASSERT_TRUE(qntest::returnsWithin([&] { mSystem.enqueue(0, makeItem(lRound)); }, std::chrono::seconds(10)));
+    EXPECT_EQ(lRound, idOf(mSystem.dequeue(0)));
+  }
+}
+
+TEST_F(SystemQueuesTest, ClearReleasesEveryElementOnce) {
+  std::atomic<int> lDestroyed{0};
+  QNCPointer<QNCQueueable> lKept = makeItem(1, &lDestroyed);
+  mSystem.enqueue(0, lKept);
+  mSystem.enqueue(0, makeItem(2, &lDestroyed));
+  mSystem.enqueue(0, makeItem(3, &lDestroyed));
+  mSystem.queueClear(0);
+  EXPECT_TRUE(mSystem.isQueueEmpty(0));
+  EXPECT_EQ(2, lDestroyed.load());
+  EXPECT_EQ(1, idOf(lKept));  // still shared with this test
+  QNCPointer<QNCQueueable> lTaken = makeItem(4, &lDestroyed);
+  mSystem.enqueue(0, lTaken);
+  lTaken = mSystem.dequeue(0);
+  EXPECT_EQ(2, lDestroyed.load());
+  lTaken.reset();
+  EXPECT_EQ(3, lDestroyed.load());
+}
+
+// An element whose destructor uses the queue it leaves: the queue must not hold its lock while
+// the element is destroyed.
+class Requeueing : public QNCQueueable {
+ public:
+  explicit Requeueing(QNCSystem& arSystem) : mSystem(arSystem) {}
+  ~Requeueing() override { mSystem.enqueue(0, makeItem(99)); }
+
+ private:
+  QNCSystem& mSystem;
+};
+
+TEST_F(SystemQueuesTest, ElementsAreDestroyedOutsideTheQueueLock) {
+  const bool lReturned = qntest::returnsWithin(
+      [&] {
+        mSystem.enqueue(0, QNCPointer<QNCQueueable>(new (std::nothrow) Requeueing(mSystem)));
+        mSystem.enqueue(0, makeItem(1));
+        mSystem.queueClear(0);
+      },
+      std::chrono::seconds(10));
+  ASSERT_TRUE(lReturned);
+  EXPECT_EQ(99, idOf(mSystem.dequeue(0)));
+  EXPECT_TRUE(mSystem.isQueueEmpty(0));
+}
+
+}  // namespace

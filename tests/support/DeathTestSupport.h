@@ -1,0 +1,48 @@
+#pragma once
+// Matching the standard error of a process that failed an assertion.
+
+#include <gtest/gtest.h>
+
+#include <ostream>
+#include <string>
+
+namespace qntest {
+
+// How often acrText occurs in acrHaystack (occurrences may not overlap).
+inline size_t countOf(const std::string& acrHaystack, const std::string& acrText) {
+  size_t lCount = 0;
+  for (size_t lAt = acrHaystack.find(acrText); lAt != std::string::npos;
+       lAt = acrHaystack.find(acrText, lAt + acrText.size()))
+    ++lCount;
+  return lCount;
+}
+
+// Matches output that holds exactly one "-H-" line, and that line reads
+// "Assertion [ <condition> ] failed".
+class AssertionOutputMatcher : public ::testing::MatcherInterface<const std::string&> {
+ public:
+  explicit AssertionOutputMatcher(std::string aCondition) : mExpected("Assertion [ " + aCondition + " ] failed") {}
+
+  bool MatchAndExplain(const std::string& acrOutput, ::testing::MatchResultListener* apListener) const override {
+    const size_t lHaltLines = countOf(acrOutput, "-H-");
+    const size_t lAt = acrOutput.find("-H-");
+    const size_t lEnd = lAt == std::string::npos ? lAt : acrOutput.find('\n', lAt);
+    const std::string lHaltLine = lAt == std::string::npos ? "" : acrOutput.substr(lAt, lEnd - lAt);
+    *apListener << "which holds " << lHaltLines << " \"-H-\" lines";
+    return lHaltLines == 1 && lHaltLine.find(mExpected) != std::string::npos &&
+           lHaltLine.size() >= mExpected.size() &&
+           lHaltLine.compare(lHaltLine.size() - mExpected.size(), mExpected.size(), mExpected) == 0;
+  }
+  void DescribeTo(std::ostream* apStream) const override {
+    *apStream << "holds exactly one \"-H-\" line, ending in \"" << mExpected << "\"";
+  }
+
+ private:
+  std::string mExpected;
+};
+
+inline ::testing::Matcher<const std::string&> assertionFailure(const std::string& acrCondition) {
+  return ::testing::MakeMatcher(new AssertionOutputMatcher(acrCondition));
+}
+
+}  // namespace qntest

@@ -1,0 +1,88 @@
+#pragma once
+// A system object for tests of the numbered services: it fills the numbered tables
+// (conditionals, queues, lists, readers, writers) the way an application's system class does,
+// and gives tests the conditionals themselves so they can take a conditional's lock directly.
+
+#include <atomic>
+#include <chrono>
+#include <functional>
+#include <future>
+#include <memory>
+#include <new>
+#include <thread>
+
+#include "Conditional.h"
+#include "QNException.h"
+#include "Reader.h"
+#include "SynchList.h"
+#include "SynchQueue.h"
+#include "System.h"
+#include "Writer.h"
+
+namespace qntest {
+
+// An element that knows its number and counts its destructions in a counter the test owns.
+class Item : public QNCQueueable {
+ public:
+  explicit Item(int aId, std::atomic<int>* apDestroyed = nullptr) : mId(aId), mpDestroyed(apDestroyed) {}
+  ~Item() override {
+    if (mpDestroyed != nullptr) mpDestroyed->fetch_add(1);
+  }
+  int mId;
+
+ private:
+  std::atomic<int>* mpDestroyed;
+};
+
+inline QNCPointer<QNCQueueable> makeItem(int aId, std::atomic<int>* apDestroyed = nullptr) {
+  return QNCPointer<QNCQueueable>(new (std::nothrow) Item(aId, apDestroyed));
+}
+
+inline int idOf(const QNCPointer<QNCQueueable>& acrElement) { return static_cast<Item*>(acrElement.get())->mId; }
+
+// Runs acrCall on a thread of its own and reports whether it returned within acLimit, so that a
+// fault shows as a failed expectation instead of a hung test program. When the call is late,
+// acrRelease (if given) must unblock it and the thread is joined; without one the thread is
+// taken to be deadlocked and is left behind, detached.
+inline bool returnsWithin(const std::function<void()>& acrCall, std::chrono::milliseconds acLimit,
+                          const std::function<void()>& acrRelease = {}) {
+  auto lDone = std::make_shared<std::promise<void>>();
+  std::future<void> lFinished = lDone->get_future();
+  std::thread lThread([acrCall, lDone] {
+    acrCall();
+    lDone->set_value();
+  });
+  const bool lInTime = lFinished.wait_for(acLimit) == std::future_status::ready;
+  if (lInTime || acrRelease) {
+    if (!lInTime) acrRelease();
+    lThread.join();
+  } else {
+    lThread.detach();
+  }
+  return lInTime;
+}
+
+class TableSystem : public QNCSystem {
+ public:
+  TableSystem(unsigned int aConditionals, unsigned int aQueues, unsigned int aLists) {
+    for (unsigned int lIndex = 0; lIndex < aConditionals; ++lIndex)
+      mWaitConditionals.append(QNCPointer<QNCConditional>(new (std::nothrow) QNCConditional));
+    for (unsigned int lIndex = 0; lIndex < aQueues; ++lIndex)
+      mQueues.append(QNCPointer<QNCSynchQueue>(new (std::nothrow) QNCSynchQueue));
+    for (unsigned int lIndex = 0; lIndex < aLists; ++lIndex)
+      mLists.append(QNCPointer<QNCSynchList>(new (std::nothrow) QNCSynchList));
+  }
+
+  // Tables are filled before any thread uses them, as the contract requires.
+  void addQueue(const QNCPointer<QNCSynchQueue>& acrQueue) { mQueues.append(acrQueue); }
+  void addReader(const QNCPointer<QNCReader>& acrReader) { mReaders.append(acrReader); }
+  void addWriter(const QNCPointer<QNCWriter>& acrWriter) { mWriters.append(acrWriter); }
+
+  QNCConditional& conditional(unsigned int aNumber) { return *mWaitConditionals[aNumber]; }
+
+  void setCommandLineArgumentDesc() override {}
+  void parseConfigFile(QNCString&) override { throw QNCNotImplementedEx("no config file", 0); }
+  void displayHelp() override {}
+};
+
+}  // namespace qntest
