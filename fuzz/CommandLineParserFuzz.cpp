@@ -9,8 +9,8 @@
 //   one of the documented forms, leaves the state "failed" and keeps no argument;
 // - after success, for every option of the table getArgument() either finds it or throws
 //   QNCNotFoundEx; a found value-taking option is a QNCOptionValueArgument holding the word that
-//   followed the option (never itself an option), a found flag is not; the options found with their values account for
-//   every word of the line exactly once;
+//   followed the option (never itself an option), a found flag is not; the options found with their values
+//   account for every word of the line exactly once;
 // - a second run() over the same line ends the same way.
 
 #include <cstdint>
@@ -26,8 +26,8 @@
 namespace {
 
 const QNSCommandLineArgumentDesc kOptions[] = {
-    {"-v", 0, "", "version"}, {"-h", 0, "", "help"},        {"-s", 0, "", "stop"},
-    {"-c", 1, "file", "config"}, {"-d", 1, "mask", "levels"}, {"-b", 1, "seconds", "heartbeat"},
+    {"-v", 0, "", "version"},          {"-h", 0, "", "help"},          {"-s", 0, "", "stop"},
+    {"-c", 1, "file", "config"},       {"-d", 1, "mask", "levels"},    {"-b", 1, "seconds", "heartbeat"},
     {"-D", 1, "true|false", "daemon"}, {"-I", 1, "minutes", "reopen"}, {"-n", 1, "count", "channels"},
 };
 
@@ -127,7 +127,8 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
-  const std::string lLine(reinterpret_cast<const char*>(apData), strnlen(reinterpret_cast<const char*>(apData), aSize));
+  const std::string lLine(reinterpret_cast<const char*>(apData),
+                          strnlen(reinterpret_cast<const char*>(apData), aSize));
   QNCVector<QNSCommandLineArgumentDesc> lTable;
   for (const QNSCommandLineArgumentDesc& lrDesc : kOptions) lTable.append(lrDesc);
 

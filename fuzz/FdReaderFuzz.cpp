@@ -87,7 +87,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
     QN_FUZZ_CHECK(lWhole);
     QN_FUZZ_CHECK(lMessage->getLength() == lLength);
     const QNCBuffer& lrBody = *lMessage;
-    QN_FUZZ_CHECK(lLength == 0 || memcmp(static_cast<const unsigned char*>(lrBody), lpStream + lAt + 4, lLength) == 0);
+    QN_FUZZ_CHECK(lLength == 0 ||
+                  memcmp(static_cast<const unsigned char*>(lrBody), lpStream + lAt + 4, lLength) == 0);
     lAt += 4 + lLength;
   }
 }

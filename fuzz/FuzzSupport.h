@@ -9,12 +9,12 @@
 #include <cstdio>
 #include <cstdlib>
 
-#define QN_FUZZ_CHECK(condition)                                                                 \
-  do {                                                                                           \
-    if (!(condition)) {                                                                          \
-      fprintf(stderr, "Fuzz property broken: %s (%s:%d)\n", #condition, __FILE__, __LINE__);     \
-      abort();                                                                                   \
-    }                                                                                            \
+#define QN_FUZZ_CHECK(condition)                                                             \
+  do {                                                                                       \
+    if (!(condition)) {                                                                      \
+      fprintf(stderr, "Fuzz property broken: %s (%s:%d)\n", #condition, __FILE__, __LINE__); \
+      abort();                                                                               \
+    }                                                                                        \
   } while (0)
 
 namespace qnfuzz {

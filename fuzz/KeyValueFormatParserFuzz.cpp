@@ -132,7 +132,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   for (size_t lIndex = lSkip; lIndex < aSize; ++lIndex) lLineCount += apData[lIndex] == '\n' ? 1 : 0;
 
   const QNCString lPath(gPath.c_str());
-  QNCKeyValueFormatParser lParser(lPath, QNCString(lSkip == 2 ? lMarkers.c_str() : ""), lFold, lAllowDuplicates);
+  QNCKeyValueFormatParser lParser(lPath, QNCString(lSkip == 2 ? lMarkers.c_str() : ""), lFold,
+                                  lAllowDuplicates);
   bool lParsed = false;
   try {
     lParser.parse();

@@ -23,7 +23,9 @@
 
 namespace {
 
-bool onlyDigits(const char* apText) { return *apText != '\0' && strspn(apText, "0123456789") == strlen(apText); }
+bool onlyDigits(const char* apText) {
+  return *apText != '\0' && strspn(apText, "0123456789") == strlen(apText);
+}
 
 // Decodes acrText into arValue: true on success, false on QNCInvalidEx; the kind never changes.
 bool decodes(QNCMultiType& arValue, const QNCString& acrText) {
@@ -65,7 +67,8 @@ void checkSignedByte(const QNCString& acrText) {
   const char* lpDigits = lpText[0] == '-' ? lpText + 1 : lpText;
   errno = 0;
   const long long lExpected = onlyDigits(lpDigits) ? strtoll(lpText, nullptr, 10) : 0;
-  const bool lValid = onlyDigits(lpDigits) && errno != ERANGE && lExpected >= SCHAR_MIN && lExpected <= SCHAR_MAX;
+  const bool lValid =
+      onlyDigits(lpDigits) && errno != ERANGE && lExpected >= SCHAR_MIN && lExpected <= SCHAR_MAX;
 
   QNCMultiType lValue(static_cast<signed char>(7));
   QN_FUZZ_CHECK(decodes(lValue, acrText) == lValid);
@@ -92,7 +95,8 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
-  const std::string lText(reinterpret_cast<const char*>(apData), strnlen(reinterpret_cast<const char*>(apData), aSize));
+  const std::string lText(reinterpret_cast<const char*>(apData),
+                          strnlen(reinterpret_cast<const char*>(apData), aSize));
   const QNCString lString(lText.c_str());
   checkUnsigned(lString);
   checkSignedByte(lString);

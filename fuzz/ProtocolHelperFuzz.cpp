@@ -41,7 +41,8 @@ constexpr unsigned int kSmallMaximum = 64;
 constexpr unsigned int kMaxMessagesPerInput = 64;
 
 QNCPointer<QNCBuffer> newBuffer(unsigned int aLength) {
-  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, 0), QNPST_Individual, QNPAT_New);
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, 0), QNPST_Individual,
+                               QNPAT_New);
 }
 
 class ScriptedReader : public QNCReader {
@@ -139,8 +140,8 @@ bool readOne(QNCProtocolHelper& arHelper, QNCPointer<QNCReader>& arReader, Scrip
   QN_FUZZ_CHECK(lDelivered.size() == lBodyStart + lLength);
   QN_FUZZ_CHECK(lLength <= aMaximum);
   const QNCBuffer& lrBody = *lMessage;
-  QN_FUZZ_CHECK(lLength == 0 ||
-                memcmp(static_cast<const unsigned char*>(lrBody), lDelivered.data() + lBodyStart, lLength) == 0);
+  QN_FUZZ_CHECK(lLength == 0 || memcmp(static_cast<const unsigned char*>(lrBody),
+                                       lDelivered.data() + lBodyStart, lLength) == 0);
   return true;
 }
 

@@ -59,7 +59,8 @@ int main(int argc, char** argv) {
   }
   for (const auto& lrInput : lInputs) {
     std::ifstream lStream(lrInput, std::ios::binary);
-    const std::vector<char> lBytes((std::istreambuf_iterator<char>(lStream)), std::istreambuf_iterator<char>());
+    const std::vector<char> lBytes((std::istreambuf_iterator<char>(lStream)),
+                                   std::istreambuf_iterator<char>());
     if (!lStream.eof() && lStream.fail()) {
       fprintf(stderr, "%s: cannot be read\n", lrInput.c_str());
       return 1;
