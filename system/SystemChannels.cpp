@@ -20,12 +20,14 @@ void QNCSystem::signal(unsigned int acConditionNo) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
   QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
-  // Signalling under the conditional's lock: a waiter that has found its queue or list empty
-  // still holds this lock until it is inside the wait, so the signal cannot fall between the
-  // waiter's test and its wait and be lost.
+  // A waiter that has found its queue or list empty holds this lock until it is inside the wait.
+  // Passing through the lock therefore orders this signal after that waiter's wait has begun,
+  // so it cannot fall between the waiter's test and its wait and be lost. The signal itself is
+  // given after the unlock: a thread woken while the lock is still held would only block again
+  // on it, which costs a second sleep and wake-up per hand-off.
   lConditional.lock();
-  lConditional.signal();
   lConditional.unlock();
+  lConditional.signal();
   QN_LEFT();
 }
 

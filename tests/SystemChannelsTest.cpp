@@ -6,6 +6,7 @@
 #include <string>
 
 #include "Buffer.h"
+#include "DeathTestSupport.h"
 #include "TableSystem.h"
 
 namespace {
@@ -96,23 +97,15 @@ TEST_F(SystemChannelsTest, WaitForActivityPassesTheWaitTimeToThatReader) {
   EXPECT_EQ(0u, mReaders[0]->mLastWaitTime + mReaders[1]->mLastWaitTime);
 }
 
-// --- Numbers out of range end the process with the assertion's text (exit status 1).
+// --- Numbers out of range end the process with exactly one "-H-" line, the assertion's text,
+// and exit status 1.
 
-std::string assertion(const std::string& acrCondition) {
-  std::string lPattern = "Assertion \\[ ";
-  for (char lChar : acrCondition) {
-    if (std::string("()[].*+?").find(lChar) != std::string::npos) lPattern += '\\';
-    lPattern += lChar;
-  }
-  return lPattern + " \\] failed";
-}
-
-const std::string kCondition = assertion("acConditionNo < this->mWaitConditionals.numberOfElements()");
-const std::string kQueue = assertion("acQueueNo < this->mQueues.numberOfElements()");
-const std::string kList = assertion("acListNo < this->mLists.numberOfElements()");
-const std::string kReader = assertion("acReaderNo < this->mReaders.numberOfElements()");
-const std::string kWriter = assertion("acWriterNo < this->mWriters.numberOfElements()");
-const std::string kWaitTime = assertion("acWaitTime > 0");
+const auto kCondition = qntest::assertionFailure("acConditionNo < this->mWaitConditionals.numberOfElements()");
+const auto kQueue = qntest::assertionFailure("acQueueNo < this->mQueues.numberOfElements()");
+const auto kList = qntest::assertionFailure("acListNo < this->mLists.numberOfElements()");
+const auto kReader = qntest::assertionFailure("acReaderNo < this->mReaders.numberOfElements()");
+const auto kWriter = qntest::assertionFailure("acWriterNo < this->mWriters.numberOfElements()");
+const auto kWaitTime = qntest::assertionFailure("acWaitTime > 0");
 
 using SystemChannelsDeathTest = SystemChannelsTest;
 using ::testing::ExitedWithCode;
@@ -164,7 +157,7 @@ TEST_F(SystemChannelsDeathTest, ChannelNumberOutOfRange) {
 
 TEST_F(SystemChannelsDeathTest, WaitForActivityNeedsAWaitTime) {
   EXPECT_EXIT(mSystem.waitForActivity(0, 0), ExitedWithCode(1), kWaitTime);
-  // A bad reader number is reported first.
+  // A bad reader number is reported first (and, the process having ended, alone).
   EXPECT_EXIT(mSystem.waitForActivity(3, 0), ExitedWithCode(1), kReader);
 }
 

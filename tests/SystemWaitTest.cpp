@@ -82,7 +82,7 @@ TEST_F(SystemWaitTest, SignalWhileNobodyWaitsIsNotRemembered) {
 TEST_F(SystemWaitTest, TimeOutReleasesTheConditionalForOtherThreads) {
   EXPECT_THROW(mSystem.timedWait(0, 20), QNCTimeOutEx);
   QNCConditional& lConditional = mSystem.conditional(0);
-  EXPECT_TRUE(qntest::returnsWithin(
+  ASSERT_TRUE(qntest::returnsWithin(
       [&] {
         lConditional.lock();
         lConditional.unlock();

@@ -158,9 +158,11 @@ class QNCSystem : public QNCSystemInterface {
   // safe from any thread; element order, exceptions and locking are the companion's.
   // waitOnEmptyQueue/waitOnEmptyList: block without a time limit until queue/list n holds an
   // element, testing it under conditional acConditionNo's lock and waiting on that conditional;
-  // return at once when it already holds one. They neither remove the element (another consumer
-  // may take it before the caller's dequeue/delist) nor look at the exit flag (see timedWait for
-  // a wait that ends on request). The conditional's lock is released before any exception leaves.
+  // return at once when it already holds one (waitOnEmptyList then does not even take the
+  // conditional's lock, so a busy consumer does not contend with its producers' signal()).
+  // They neither remove the element (another consumer may take it before the caller's
+  // dequeue/delist) nor look at the exit flag (see timedWait for a wait that ends on request).
+  // The conditional's lock is released before any exception leaves.
   // enqueue/enlist/enlistFront signal nothing: the producer follows them with signal(c).
   virtual void waitOnEmptyQueue(unsigned int acConditionNo, unsigned int acQueueNo);
   virtual void enqueue(unsigned int acQueueNo, const QNCPointer<QNCQueueable>& acrElement);
