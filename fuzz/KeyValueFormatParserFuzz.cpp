@@ -1,0 +1,161 @@
+// Fuzz target: a configuration file of arbitrary bytes read by QNCKeyValueFormatParser.
+//
+// Input layout: byte 0 chooses the parser's options (bit 0: keys without regard to case, bit 1:
+// duplicates allowed, bit 2: byte 1 is the only comment marker); the rest is the file's contents.
+// The parser reads through a path, so the contents go into a memory file opened by its
+// /proc/self/fd path: nothing touches the disk and nothing is left behind.
+//
+// Properties, for every input:
+// - parse() succeeds or throws a QNCException; a malformed line or a repeated key names the file
+//   and the line; a failed parse keeps nothing;
+// - after success every key getKeys() reports is found by hasKey(), getValue() and getLine(), is
+//   not blank-padded, starts with no comment marker, comes from a line of the file, and appears
+//   once (compared as the parser compares keys); getUnsigned() either gives the number the value
+//   spells in decimal or throws QNCInvalidEx.
+
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <set>
+#include <string>
+
+#include "FuzzSupport.h"
+#include "KeyValueFormatParser.h"
+#include "Logger.h"
+#include "QNException.h"
+
+namespace {
+
+int gMemoryFile = -1;
+std::string gPath;
+
+// Replaces the memory file's contents with the input's.
+void store(const uint8_t* apData, size_t aSize) {
+  QN_FUZZ_CHECK(ftruncate(gMemoryFile, 0) == 0);
+  size_t lDone = 0;
+  while (lDone < aSize) {
+    const ssize_t lWritten = pwrite(gMemoryFile, apData + lDone, aSize - lDone, static_cast<off_t>(lDone));
+    if (lWritten < 0 && errno == EINTR) continue;  // nothing was written; the same write is safe again
+    QN_FUZZ_CHECK(lWritten > 0);
+    lDone += static_cast<size_t>(lWritten);
+  }
+}
+
+std::string folded(const char* apText, bool aFold) {
+  std::string lText(apText);
+  if (aFold) {
+    for (char& lrChar : lText) {
+      if (lrChar >= 'A' && lrChar <= 'Z') lrChar = static_cast<char>(lrChar - 'A' + 'a');
+    }
+  }
+  return lText;
+}
+
+bool isBlank(char aChar) { return aChar == ' ' || aChar == '\t' || aChar == '\r'; }
+
+bool startsWith(const char* apText, const std::string& acrPrefix) {
+  return strncmp(apText, acrPrefix.c_str(), acrPrefix.size()) == 0;
+}
+
+// getUnsigned() agrees with an independent reading of the value as a decimal unsigned int.
+void checkUnsigned(const QNCKeyValueFormatParser& acrParser, const QNCString& acrKey) {
+  const std::string lValue = acrParser.getValue(acrKey).get();
+  const bool lDigitsOnly = !lValue.empty() && lValue.find_first_not_of("0123456789") == std::string::npos;
+  errno = 0;
+  const unsigned long long lExpected = lDigitsOnly ? strtoull(lValue.c_str(), nullptr, 10) : 0;
+  const bool lInRange = lDigitsOnly && errno != ERANGE && lExpected <= 0xFFFFFFFFull;
+  try {
+    const unsigned int lNumber = acrParser.getUnsigned(acrKey);
+    QN_FUZZ_CHECK(lInRange);
+    QN_FUZZ_CHECK(lNumber == lExpected);
+  } catch (const QNCInvalidEx& acrException) {
+    QN_FUZZ_CHECK(!lInRange);
+    QN_FUZZ_CHECK(strstr(acrException.what(), "expects a number") != nullptr);
+  }
+}
+
+void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& acrMarkers, bool aFold,
+                 unsigned int aLineCount) {
+  QNCVector<QNCString> lKeys;
+  acrParser.getKeys(lKeys);
+  std::set<std::string> lSeen;
+  const unsigned int lCount = lKeys.numberOfElements();
+  for (unsigned int lIndex = 0; lIndex < lCount; ++lIndex) {
+    const char* lpKey = lKeys[lIndex].get();
+    const size_t lLength = strlen(lpKey);
+    QN_FUZZ_CHECK(lLength != 0);
+    QN_FUZZ_CHECK(!isBlank(lpKey[0]) && !isBlank(lpKey[lLength - 1]));
+    QN_FUZZ_CHECK(acrMarkers.find(lpKey[0]) == std::string::npos);
+    QN_FUZZ_CHECK(strchr(lpKey, '=') == nullptr && strchr(lpKey, '\n') == nullptr);
+    QN_FUZZ_CHECK(lSeen.insert(folded(lpKey, aFold)).second);
+    // Lookups are linear in the number of keys; a file of thousands of keys is checked at both
+    // ends so one input stays fast, while the uniqueness above covers every key.
+    if (lIndex >= 128 && lIndex + 128 < lCount) continue;
+    QN_FUZZ_CHECK(acrParser.hasKey(lKeys[lIndex]));
+    const char* lpValue = acrParser.getValue(lKeys[lIndex]).get();
+    const size_t lValueLength = strlen(lpValue);
+    QN_FUZZ_CHECK(lValueLength == 0 || (!isBlank(lpValue[0]) && !isBlank(lpValue[lValueLength - 1])));
+    QN_FUZZ_CHECK(strchr(lpValue, '\n') == nullptr);
+    const unsigned int lLine = acrParser.getLine(lKeys[lIndex]);
+    QN_FUZZ_CHECK(lLine >= 1 && lLine <= aLineCount);
+    checkUnsigned(acrParser, lKeys[lIndex]);
+  }
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerInitialize(int*, char***) {
+  setLogCode(0);
+  gMemoryFile = memfd_create("qnfuzz-config", MFD_CLOEXEC);
+  QN_FUZZ_CHECK(gMemoryFile >= 0);
+  gPath = "/proc/self/fd/" + std::to_string(gMemoryFile);
+  return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
+  if (aSize == 0) return 0;
+  const uint8_t lFlags = apData[0];
+  const bool lFold = (lFlags & 1) != 0;
+  const bool lAllowDuplicates = (lFlags & 2) != 0;
+  std::string lMarkers = "#;";
+  size_t lSkip = 1;
+  if ((lFlags & 4) != 0 && aSize > 1) {
+    lSkip = 2;
+    if (apData[1] != 0) lMarkers = std::string(1, static_cast<char>(apData[1]));
+  }
+  store(apData + lSkip, aSize - lSkip);
+  unsigned int lLineCount = 1;
+  for (size_t lIndex = lSkip; lIndex < aSize; ++lIndex) lLineCount += apData[lIndex] == '\n' ? 1 : 0;
+
+  const QNCString lPath(gPath.c_str());
+  QNCKeyValueFormatParser lParser(lPath, QNCString(lSkip == 2 ? lMarkers.c_str() : ""), lFold,
+                                  lAllowDuplicates);
+  bool lParsed = false;
+  try {
+    lParser.parse();
+    lParsed = true;
+  } catch (const QNCInvalidEx& acrException) {
+    QN_FUZZ_CHECK(startsWith(acrException.what(), gPath + ":"));
+    QN_FUZZ_CHECK(strstr(acrException.what(), "expected 'key = value'") != nullptr);
+  } catch (const QNCExistsEx& acrException) {
+    QN_FUZZ_CHECK(!lAllowDuplicates);
+    QN_FUZZ_CHECK(startsWith(acrException.what(), gPath + ":"));
+  } catch (const QNCException&) {
+    // Another member of the family (no memory, an unreadable file): a clear error as well.
+  } catch (...) {
+    qnfuzz::foreignException("QNCKeyValueFormatParser::parse");
+  }
+  if (!lParsed) {
+    // A failed parse keeps nothing of the file.
+    QNCVector<QNCString> lKeys;
+    lParser.getKeys(lKeys);
+    QN_FUZZ_CHECK(lKeys.numberOfElements() == 0);
+    return 0;
+  }
+  checkParsed(lParser, lMarkers, lFold, lLineCount);
+  return 0;
+}
