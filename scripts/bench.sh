@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Builds the benchmarks in Release and runs every one of them. Extra arguments go to each
 # benchmark program (for example --benchmark_filter=Pool).
-# Figures are medians of 5 repetitions; logs go to a temporary directory.
+# Figures are medians of 5 repetitions, the contenders interleaved through the run; logs go to a
+# temporary directory.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/ensure-deps.sh
@@ -17,5 +18,6 @@ echo "compiler: $(g++ --version | head -n1); flags: -O3 -DNDEBUG (CMake Release)
 for bench in build/bench/bench/*Bench; do
   [ -x "$bench" ] || continue
   echo "=== $(basename "$bench") ==="
-  "$bench" --benchmark_repetitions=5 --benchmark_report_aggregates_only=true "$@"
+  "$bench" --benchmark_repetitions=5 --benchmark_enable_random_interleaving=true \
+    --benchmark_report_aggregates_only=true "$@"
 done
