@@ -16,9 +16,10 @@ class SensorServiceTest : public ::testing::Test {
  protected:
   // Starts the service in the foreground with every level but trace, and waits until it runs
   // (its signal handlers exist only from then on).
-  pid_t startService() {
-    const pid_t lPid = qntest::spawn({qntest::builtProgram("examples/qnsensord"), "-D", "false", "-d", "127"},
-                                     environment(), mDir.file("stdout"), mDir.file("stderr"));
+  pid_t startService(const std::vector<std::string>& acrExtra = {}) {
+    std::vector<std::string> lArgv = {qntest::builtProgram("examples/qnsensord"), "-D", "false", "-d", "127"};
+    lArgv.insert(lArgv.end(), acrExtra.begin(), acrExtra.end());
+    const pid_t lPid = qntest::spawn(lArgv, environment(), mDir.file("stdout"), mDir.file("stderr"));
     EXPECT_TRUE(qntest::waitForText(mLog, "qnsensord running")) << qntest::readFile(mLog);
     return lPid;
   }
@@ -80,17 +81,23 @@ TEST_F(SensorServiceTest, ServesReadingsAndStopsOnRequest) {
                        "Destroying System", "Statistics:", "Destroying the Logger. You won't see any more logs!"});
 }
 
-// SIGTERM while idle: components in index order before the pool, then the shut-down lines.
+// SIGTERM while idle: components in index order before the pool, then the shut-down lines. The
+// heartbeat (every -b seconds) sleeps with waitAndCheckExit and ends on its exit notice.
 TEST_F(SensorServiceTest, SigtermShutsDownInOrder) {
-  const pid_t lService = startService();
+  const pid_t lService = startService({"-b", "1"});
+  ASSERT_TRUE(qntest::waitForText(mLog, "Heartbeat: 0 readings answered")) << qntest::readFile(mLog);
   ASSERT_EQ(0, kill(lService, SIGTERM));
   EXPECT_EQ(0, qntest::waitExit(lService));
   const std::string lLog = qntest::readFile(mLog);
   expectInOrder(lLog, {"Started Thread: ChannelWorker-0", "Started Thread: ChannelWorker-1",
-                       "Started Thread: ReadingConsumer", "Started Threads in Thread Pool: Reporters",
-                       "Waiting for 'ChannelWorker-0' thread to exit", "Waiting for 'ReadingConsumer' thread to exit",
+                       "Started Thread: ReadingConsumer", "Started Thread: Heartbeat",
+                       "Started Threads in Thread Pool: Reporters", "Waiting for 'ChannelWorker-0' thread to exit",
+                       "Waiting for 'ReadingConsumer' thread to exit", "Waiting for 'Heartbeat' thread to exit",
                        "Waiting for threads in 'Reporters' ThreadPool to exit", "All threads have gracefully exited",
                        "Destroying System", "Destroying the Logger. You won't see any more logs!"});
+  // The heartbeat leaves its sleep on the exit flag, before the main thread has joined it.
+  expectInOrder(lLog, {"Started Threads in Thread Pool: Reporters", "Process is marked for exit.",
+                       "Waiting for threads in 'Reporters' ThreadPool to exit"});
   // Without -c the only error line is the driver's note that no configuration file is read.
   EXPECT_EQ(1u, count(lLog, " -E- ")) << lLog;
 }

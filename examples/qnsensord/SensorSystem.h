@@ -37,7 +37,7 @@ class QNCSensorSystem : public QNCSystem {
   // The base, then one channel per ChannelCount (a Unix-domain socket qnsensord.<n>.sock in the
   // log directory) as reader and writer n, conditional 0 and list 0 (SensorThreads.cpp).
   void init() override;
-  // One ChannelWorker per channel, the ReadingConsumer, and the Reporters pool.
+  // One ChannelWorker per channel, the ReadingConsumer, the Heartbeat, and the Reporters pool.
   void createThreads() override;
   // The base, then the per-sensor statistics at notice level.
   void destroy() override;

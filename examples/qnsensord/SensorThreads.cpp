@@ -3,7 +3,8 @@
 //   channel n  --reader n-->  ChannelWorker-n  --enlist + signal-->  list 0 / conditional 0
 //   list 0     --delist-->    ReadingConsumer  --framed answer-->    writer n
 //
-// One ChannelWorker per channel, one ReadingConsumer, and the "Reporters" pool that logs progress.
+// One ChannelWorker per channel, one ReadingConsumer, a Heartbeat, and the "Reporters" pool that
+// logs progress.
 
 #include <unistd.h>
 
@@ -11,7 +12,9 @@
 
 #include "Conditional.h"
 #include "ChannelWorker.h"
+#include "HeartbeatThread.h"
 #include "Logger.h"
+#include "MultiType.h"
 #include "ProtocolHelper.h"
 #include "ReadingConsumer.h"
 #include "SensorChannel.h"
@@ -56,6 +59,10 @@ void QNCSensorSystem::createThreads() {
   }
   mThreadComponents.append(QNCPointer<QNCThreadComponent>(
       new (std::nothrow) QNCReadingConsumer(*this, mStatistics, lReporters), QNPST_Individual, QNPAT_New));
+  QNCPointer<QNCMultiType> lHbTimeout;
+  getSetting("HbTimeout", lHbTimeout);
+  mThreadComponents.append(QNCPointer<QNCThreadComponent>(
+      new (std::nothrow) QNCHeartbeatThread(*this, mStatistics, *lHbTimeout), QNPST_Individual, QNPAT_New));
   mThreadPools.append(lReporters);
 }
 
