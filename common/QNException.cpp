@@ -1,6 +1,7 @@
 #include "QNException.h"
 
 #include <cstring>
+#include <exception>
 
 QNCException::QNCException() noexcept : mCode(0) { mMessage[0] = '\0'; }
 
@@ -23,6 +24,20 @@ QNCException& QNCException::operator=(const QNCException& acrCopy) noexcept {
 QNCException::~QNCException() = default;
 
 const char* QNCException::what() const noexcept { return mMessage; }
+
+const char* QNCurrentExceptionText() noexcept {
+  // Rethrowing the exception being handled reaches the same object, which lives until the
+  // caller's handler ends, so its text may be returned.
+  try {
+    throw;
+  } catch (const QNCException& acrException) {
+    return acrException.what();
+  } catch (const std::exception& acrException) {
+    return acrException.what();
+  } catch (...) {
+    return "unknown exception";
+  }
+}
 
 void QNCException::_store(const char* apMessage) noexcept {
   // A null message is stored as the empty text rather than read.

@@ -62,10 +62,8 @@ void dispatchSignals(int aReadFd) {
     // The dispatcher must survive whatever a handler throws: it serves every later signal.
     try {
       lpHandler(lSignal);
-    } catch (const QNCException& acrException) {
-      QN_LOG_ERROR("Signal %d handler failed: %s", static_cast<int>(lSignal), acrException.what());
     } catch (...) {
-      QN_LOG_ERROR("Signal %d handler failed with an unknown exception", static_cast<int>(lSignal));
+      QN_LOG_ERROR("Signal %d handler failed: %s", static_cast<int>(lSignal), QNCurrentExceptionText());
     }
   }
 }

@@ -2,7 +2,6 @@
 
 #include <chrono>
 #include <cstdio>
-#include <exception>
 #include <system_error>
 
 #include "Logger.h"
@@ -101,11 +100,7 @@ void QNCThreadComponent::_body() {
   gspCurrentComponent = this;
   try {
     run();
-  } catch (const QNCException& acrException) {
-    QN_LOG_ERROR("Thread '%s' ended by an exception: %s", mName.get(), acrException.what());
-  } catch (const std::exception& acrException) {
-    QN_LOG_ERROR("Thread '%s' ended by an exception: %s", mName.get(), acrException.what());
   } catch (...) {
-    QN_LOG_ERROR("Thread '%s' ended by an exception: %s", mName.get(), "unknown exception");
+    QN_LOG_ERROR("Thread '%s' ended by an exception: %s", mName.get(), QNCurrentExceptionText());
   }
 }

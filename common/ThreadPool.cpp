@@ -1,7 +1,6 @@
 #include "ThreadPool.h"
 
 #include <cstdio>
-#include <exception>
 #include <new>
 #include <system_error>
 #include <utility>
@@ -123,11 +122,7 @@ void QNCThreadPool::_run(QNTTask& arTask) {
   // thread function, the process.
   try {
     arTask();
-  } catch (const QNCException& acrException) {
-    QN_LOG_ERROR("ThreadPool '%s': task failed: %s", mName.get(), acrException.what());
-  } catch (const std::exception& acrException) {
-    QN_LOG_ERROR("ThreadPool '%s': task failed: %s", mName.get(), acrException.what());
   } catch (...) {
-    QN_LOG_ERROR("ThreadPool '%s': task failed: %s", mName.get(), "unknown exception");
+    QN_LOG_ERROR("ThreadPool '%s': task failed: %s", mName.get(), QNCurrentExceptionText());
   }
 }

@@ -38,6 +38,11 @@ class QNCException {
   unsigned int mCode;
 };
 
+// The message of the exception now being handled: what() of a QNCException or a std::exception,
+// else "unknown exception". Call it only inside a catch block; the text lives as long as that
+// handler. For code that must survive whatever a callback throws and report it.
+const char* QNCurrentExceptionText() noexcept;
+
 // Declares one member of the family. Categories keep a protected default constructor so that
 // their descendants initialise the shared root themselves.
 #define QN_DECLARE_EXCEPTION(Name, ...)                                           \
