@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <future>
 #include <cerrno>
 #include <mutex>
 #include <thread>
@@ -47,7 +48,8 @@ void onSignal(int aSignal) {
   errno = lSavedErrno;
 }
 
-void dispatchSignals(int aReadFd) {
+void dispatchSignals(int aReadFd, std::promise<void> aStarted) {
+  aStarted.set_value();
   for (;;) {
     unsigned char lSignal = 0;
     const ssize_t lRead = read(aReadFd, &lSignal, 1);
@@ -84,8 +86,14 @@ void startDispatcher() {
     close(lPipe[1]);
     OsThrowError<QNCOsException>(lErrno, "fcntl O_NONBLOCK");
   }
+  // The registration returns only once the dispatcher runs: a fork right after it then never
+  // copies a thread that is half-way through its start (holding the allocator's or a runtime's
+  // locks, which the child could never get back).
+  std::promise<void> lStarted;
+  std::future<void> lRunning = lStarted.get_future();
   try {
-    std::thread(dispatchSignals, lPipe[0]).detach();
+    std::thread(dispatchSignals, lPipe[0], std::move(lStarted)).detach();
+    lRunning.wait();
   } catch (const std::system_error& acrError) {
     close(lPipe[0]);
     close(lPipe[1]);

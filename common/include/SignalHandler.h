@@ -5,7 +5,9 @@
 // signal number to a pipe. One dispatcher thread, started by the first registration, reads the
 // pipe and calls the registered function with the signal number, one signal at a time, in the
 // order they arrived. So the function may take locks and log, and the signal is handled
-// whichever thread it lands on, also threads the application created itself. Registering again
+// whichever thread it lands on, also threads the application created itself. The first
+// registration returns once the dispatcher runs, so a fork after it never copies a half-started
+// thread. Registering again
 // for the same signal replaces the function; a null function takes the signal and does nothing.
 // An exception that leaves the function is logged as "-E-" and the dispatcher goes on.
 //
