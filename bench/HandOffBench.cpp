@@ -9,6 +9,7 @@
 //
 //   Stream/P:C   P producers hand kStreamBatch items in total to C consumers; items per second.
 //   PingPong     one object goes back and forth between two threads; round trips per second.
+//   OneThread    one thread hands items to itself: the calls' cost without contention.
 //
 // The objects exist before the clock starts and outlive the batch in both contenders, so each
 // hand-off costs one reference taken by the producer and one dropped by the consumer, and no
@@ -234,6 +235,39 @@ void BM_PingPong(benchmark::State& arState) {
   qnbench::setTraceLogging(true);
 }
 BENCHMARK(BM_PingPong)->UseManualTime()->Iterations(20);
+
+// One thread hands items to itself: the cost of the calls without any contention, which shows how
+// much of the stream's gap is the number of locks per item rather than the hand-off between cores.
+void BM_OneThread(benchmark::State& arState) {
+  qnbench::setTraceLogging(false);
+  constexpr int kBatch = 10000;
+  HandOffSystem lSystem;
+  BaselineQueue lBaseline;
+  const QNCPointer<QNCQueueable> lSystemItem(new (std::nothrow) Item);
+  const auto lBaselineItem = std::make_shared<Item>();
+  auto lTime = [](auto aBody) {
+    const Clock::time_point lStart = Clock::now();
+    for (int lItem = 0; lItem < kBatch; ++lItem) aBody();
+    return std::chrono::duration<double>(Clock::now() - lStart).count();
+  };
+  double lBaselineSeconds = 0;
+  double lSystemSeconds = 0;
+  for (auto _ : arState) {
+    lBaselineSeconds += lTime([&] {
+      lBaseline.push(lBaselineItem);
+      benchmark::DoNotOptimize(lBaseline.pop());
+    });
+    const double lRound = lTime([&] {
+      lSystem.handOff(0, lSystemItem);
+      benchmark::DoNotOptimize(lSystem.take(0));
+    });
+    lSystemSeconds += lRound;
+    arState.SetIterationTime(lRound);
+  }
+  reportRates(arState, lBaselineSeconds, lSystemSeconds, static_cast<double>(arState.iterations()) * kBatch);
+  qnbench::setTraceLogging(true);
+}
+BENCHMARK(BM_OneThread)->UseManualTime()->Iterations(200);
 
 }  // namespace
 

@@ -11,9 +11,36 @@ QNCSynchList::~QNCSynchList() {
   mMutex.reset();
 }
 
-// The node is allocated before the lock: a failed allocation leaves the list untouched, and
-// other threads do not wait behind the allocator.
+bool QNCSynchList::_enlistIntoSpare(const QNCPointer<QNCQueueable>& acrElement, bool aAtFront) {
+  if (mSpareNodes.isEmpty()) return false;
+  // The spare node's pointer is empty: the assignment releases nothing under the lock.
+  if (aAtFront) {
+    mList.spliceFront(mSpareNodes, mSpareNodes.begin());
+    mList.front() = acrElement;
+  } else {
+    mList.spliceBack(mSpareNodes, mSpareNodes.begin());
+    mList.back() = acrElement;
+  }
+  return true;
+}
+
+QNCPointer<QNCQueueable> QNCSynchList::_take(Elements::iterator aPosition, Elements& arFreed) {
+  QNCPointer<QNCQueueable> lElement(std::move(*aPosition));  // a move: no counter traffic
+  if (mSpareNodes.numberOfElements() < kSpareNodes) {
+    mSpareNodes.spliceBack(mList, aPosition);
+  } else {
+    arFreed.spliceBack(mList, aPosition);
+  }
+  return lElement;
+}
+
+// Without a spare node, the node is allocated outside the lock: a failed allocation leaves the
+// list untouched, and other threads do not wait behind the allocator.
 void QNCSynchList::enlist(const QNCPointer<QNCQueueable>& acrElement) {
+  {
+    QNCMutexLocker lGuard(*mMutex);
+    if (_enlistIntoSpare(acrElement, false)) return;
+  }
   Elements lNode;
   lNode.pushBack(acrElement);
   QNCMutexLocker lGuard(*mMutex);
@@ -21,30 +48,29 @@ void QNCSynchList::enlist(const QNCPointer<QNCQueueable>& acrElement) {
 }
 
 void QNCSynchList::enlistFront(const QNCPointer<QNCQueueable>& acrElement) {
-  QNCMutexLocker lGuard(*mMutex);
-  mList.pushFront(acrElement);
-}
-
-// The removed node is unlinked into a local list under the lock (no allocation, no counter
-// traffic) and its element moved out after the lock; the node is freed outside the lock too.
-QNCPointer<QNCQueueable> QNCSynchList::delist() {
-  Elements lTaken;
   {
     QNCMutexLocker lGuard(*mMutex);
-    if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
-    lTaken.spliceBack(mList, mList.begin());
+    if (_enlistIntoSpare(acrElement, true)) return;
   }
-  return std::move(lTaken.front());
+  Elements lNode;
+  lNode.pushBack(acrElement);
+  QNCMutexLocker lGuard(*mMutex);
+  mList.spliceFront(lNode, lNode.begin());
+}
+
+// lFreed is declared before the lock, so a node beyond the spares is freed after the lock.
+QNCPointer<QNCQueueable> QNCSynchList::delist() {
+  Elements lFreed;
+  QNCMutexLocker lGuard(*mMutex);
+  if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
+  return _take(mList.begin(), lFreed);
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::delistBack() {
-  Elements lTaken;
-  {
-    QNCMutexLocker lGuard(*mMutex);
-    if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
-    lTaken.spliceBack(mList, std::prev(mList.end()));
-  }
-  return std::move(lTaken.front());
+  Elements lFreed;
+  QNCMutexLocker lGuard(*mMutex);
+  if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
+  return _take(std::prev(mList.end()), lFreed);
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::front() {
@@ -73,10 +99,11 @@ bool QNCSynchList::isEmpty() {
 }
 
 void QNCSynchList::erase(Elements::iterator& arPosition) {
-  Elements lTaken;
+  Elements lFreed;
+  QNCPointer<QNCQueueable> lErased;
   QNCMutexLocker lGuard(*mMutex);
   const Elements::iterator lNext = std::next(arPosition);
-  lTaken.spliceBack(mList, arPosition);
+  lErased = _take(arPosition, lFreed);
   arPosition = lNext;
-  // lGuard is released before lTaken, so the erased element is destroyed outside the lock.
+  // lGuard is released before lErased, so the erased element is destroyed outside the lock.
 }

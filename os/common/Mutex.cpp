@@ -16,5 +16,3 @@ QNCMutex::~QNCMutex() {
   QN_LEFT();
 }
 
-void QNCMutex::lock() { OsLockMutex(mMutex); }
-void QNCMutex::unlock() { OsUnlockMutex(mMutex); }

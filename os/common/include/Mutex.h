@@ -5,6 +5,8 @@
 
 #include <pthread.h>
 
+#include "Os.h"
+
 class QNCMutex {
  public:
   // Throws QNCOsException when the system cannot create the mutex.
@@ -17,9 +19,9 @@ class QNCMutex {
   virtual ~QNCMutex();
 
   // Blocks, as long as necessary, until the calling thread holds the mutex.
-  void lock();
+  void lock() { OsLockMutex(mMutex); }
   // The calling thread must hold the mutex.
-  void unlock();
+  void unlock() { OsUnlockMutex(mMutex); }
 
   // The system mutex, for QNCConditional to wait with.
   pthread_mutex_t& getMutex() { return mMutex; }
