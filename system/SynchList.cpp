@@ -11,36 +11,9 @@ QNCSynchList::~QNCSynchList() {
   mMutex.reset();
 }
 
-bool QNCSynchList::_enlistIntoSpare(const QNCPointer<QNCQueueable>& acrElement, bool aAtFront) {
-  if (mSpareNodes.isEmpty()) return false;
-  // The spare node's pointer is empty: the assignment releases nothing under the lock.
-  if (aAtFront) {
-    mList.spliceFront(mSpareNodes, mSpareNodes.begin());
-    mList.front() = acrElement;
-  } else {
-    mList.spliceBack(mSpareNodes, mSpareNodes.begin());
-    mList.back() = acrElement;
-  }
-  return true;
-}
-
-QNCPointer<QNCQueueable> QNCSynchList::_take(Elements::iterator aPosition, Elements& arFreed) {
-  QNCPointer<QNCQueueable> lElement(std::move(*aPosition));  // a move: no counter traffic
-  if (mSpareNodes.numberOfElements() < kSpareNodes) {
-    mSpareNodes.spliceBack(mList, aPosition);
-  } else {
-    arFreed.spliceBack(mList, aPosition);
-  }
-  return lElement;
-}
-
-// Without a spare node, the node is allocated outside the lock: a failed allocation leaves the
-// list untouched, and other threads do not wait behind the allocator.
+// The node is allocated before the lock: a failed allocation leaves the list untouched, and
+// other threads do not wait behind the allocator.
 void QNCSynchList::enlist(const QNCPointer<QNCQueueable>& acrElement) {
-  {
-    QNCMutexLocker lGuard(*mMutex);
-    if (_enlistIntoSpare(acrElement, false)) return;
-  }
   Elements lNode;
   lNode.pushBack(acrElement);
   QNCMutexLocker lGuard(*mMutex);
@@ -48,29 +21,30 @@ void QNCSynchList::enlist(const QNCPointer<QNCQueueable>& acrElement) {
 }
 
 void QNCSynchList::enlistFront(const QNCPointer<QNCQueueable>& acrElement) {
-  {
-    QNCMutexLocker lGuard(*mMutex);
-    if (_enlistIntoSpare(acrElement, true)) return;
-  }
-  Elements lNode;
-  lNode.pushBack(acrElement);
   QNCMutexLocker lGuard(*mMutex);
-  mList.spliceFront(lNode, lNode.begin());
+  mList.pushFront(acrElement);
 }
 
-// lFreed is declared before the lock, so a node beyond the spares is freed after the lock.
+// The removed node is unlinked into a local list under the lock (no allocation, no counter
+// traffic) and its element moved out after the lock; the node is freed outside the lock too.
 QNCPointer<QNCQueueable> QNCSynchList::delist() {
-  Elements lFreed;
-  QNCMutexLocker lGuard(*mMutex);
-  if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
-  return _take(mList.begin(), lFreed);
+  Elements lTaken;
+  {
+    QNCMutexLocker lGuard(*mMutex);
+    if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
+    lTaken.spliceBack(mList, mList.begin());
+  }
+  return std::move(lTaken.front());
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::delistBack() {
-  Elements lFreed;
-  QNCMutexLocker lGuard(*mMutex);
-  if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
-  return _take(std::prev(mList.end()), lFreed);
+  Elements lTaken;
+  {
+    QNCMutexLocker lGuard(*mMutex);
+    if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
+    lTaken.spliceBack(mList, std::prev(mList.end()));
+  }
+  return std::move(lTaken.front());
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::front() {
@@ -99,11 +73,10 @@ bool QNCSynchList::isEmpty() {
 }
 
 void QNCSynchList::erase(Elements::iterator& arPosition) {
-  Elements lFreed;
-  QNCPointer<QNCQueueable> lErased;
+  Elements lTaken;
   QNCMutexLocker lGuard(*mMutex);
   const Elements::iterator lNext = std::next(arPosition);
-  lErased = _take(arPosition, lFreed);
+  lTaken.spliceBack(mList, arPosition);
   arPosition = lNext;
-  // lGuard is released before lErased, so the erased element is destroyed outside the lock.
+  // lGuard is released before lTaken, so the erased element is destroyed outside the lock.
 }

@@ -22,15 +22,11 @@ void QNCSystem::signal(unsigned int acConditionNo) {
   QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
   // A waiter that has found its queue or list empty holds this lock until it is inside the wait.
   // Passing through the lock therefore orders this signal after that waiter's wait has begun,
-  // so it cannot fall between the waiter's test and its wait and be lost. Nobody holding the
-  // lock means no waiter is between its test and its wait: each one tests after the change that
-  // preceded this signal, and the pass is skipped. The signal itself is given after the unlock:
-  // a thread woken while the lock is still held would only block again on it, which costs a
-  // second sleep and wake-up per hand-off.
-  if (lConditional.hasLockers()) {
-    lConditional.lock();
-    lConditional.unlock();
-  }
+  // so it cannot fall between the waiter's test and its wait and be lost. The signal itself is
+  // given after the unlock: a thread woken while the lock is still held would only block again
+  // on it, which costs a second sleep and wake-up per hand-off.
+  lConditional.lock();
+  lConditional.unlock();
   lConditional.signal();
   QN_LEFT();
 }

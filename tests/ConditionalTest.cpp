@@ -124,27 +124,4 @@ TEST(ConditionalTest, SignalWakesTheWaiterForEveryHandOver) {
   EXPECT_EQ(2 * kRounds, lTurn);
 }
 
-// hasLockers() is what lets a producer skip passing through the lock, so it must never say
-// false while a thread holds the lock, waits inside it, or holds it again after a time-out.
-TEST(ConditionalTest, HasLockersCountsHoldersAndWaitersUntilTheirUnlock) {
-  QNCConditional lConditional;
-  EXPECT_FALSE(lConditional.hasLockers());
-  std::atomic<int> lStage{0};
-  std::thread lWaiter([&] {
-    lConditional.lock();
-    lStage = 1;
-    EXPECT_THROW(lConditional.timedWait(100), QNCTimeOutEx);
-    lStage = 2;
-    while (lStage.load() != 3) std::this_thread::sleep_for(milliseconds(1));
-    lConditional.unlock();
-  });
-  while (lStage.load() != 1) std::this_thread::sleep_for(milliseconds(1));
-  EXPECT_TRUE(lConditional.hasLockers()) << "holding or waiting";
-  while (lStage.load() != 2) std::this_thread::sleep_for(milliseconds(1));
-  EXPECT_TRUE(lConditional.hasLockers()) << "holding again after the time-out";
-  lStage = 3;
-  lWaiter.join();
-  EXPECT_FALSE(lConditional.hasLockers());
-}
-
 }  // namespace

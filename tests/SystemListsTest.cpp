@@ -137,23 +137,6 @@ TEST_F(SystemListsTest, EveryWayOutOfTheListReleasesItsReferenceOnce) {
   EXPECT_EQ(6, lDestroyed.load());
 }
 
-// Removals keep emptied nodes for later additions: those must land at the right end and the
-// kept nodes must hold nothing, also once more elements passed than nodes are kept.
-TEST_F(SystemListsTest, RecycledNodesKeepNoElementAndServeBothEnds) {
-  std::atomic<int> lDestroyed{0};
-  const int lMany = static_cast<int>(QNCSynchList::kSpareNodes) + 10;
-  for (int lId = 0; lId < lMany; ++lId) mSystem.enlist(0, makeItem(lId, &lDestroyed));
-  for (int lId = 0; lId < lMany; ++lId) ASSERT_EQ(lId, idOf(mSystem.delist(0)));
-  EXPECT_EQ(lMany, lDestroyed.load());
-  mSystem.enlist(0, makeItem(1));
-  mSystem.enlist(0, makeItem(2));
-  mSystem.enlistFront(0, makeItem(3));
-  EXPECT_EQ((std::vector<int>{3, 1, 2}), walk(mSystem, 0));
-  EXPECT_EQ(2, idOf(mSystem.delistBack(0)));
-  mSystem.enlistFront(0, makeItem(4));
-  EXPECT_EQ((std::vector<int>{4, 3, 1}), walk(mSystem, 0));
-}
-
 // An element whose destructor uses the list it leaves: removing it must not hold the list's
 // lock while the element is destroyed, or the destructor would deadlock on it.
 class Reenlisting : public QNCQueueable {

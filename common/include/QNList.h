@@ -83,10 +83,6 @@ class QNCList {
 
   // Moves the element at aPosition of arOther to the end of this list without allocating.
   void spliceBack(QNCList& arOther, iterator aPosition) noexcept { mList.splice(mList.end(), arOther.mList, aPosition); }
-  // The same, to the front of this list.
-  void spliceFront(QNCList& arOther, iterator aPosition) noexcept {
-    mList.splice(mList.begin(), arOther.mList, aPosition);
-  }
 
  private:
   void _copyFrom(const QNCList& acrCopy) {

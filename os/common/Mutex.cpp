@@ -16,3 +16,5 @@ QNCMutex::~QNCMutex() {
   QN_LEFT();
 }
 
+void QNCMutex::lock() { OsLockMutex(mMutex); }
+void QNCMutex::unlock() { OsUnlockMutex(mMutex); }

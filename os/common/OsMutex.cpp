@@ -16,7 +16,15 @@ void OsInitMutex(pthread_mutex_t& arMutex) {
   if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_mutex_init");
 }
 
-void OsThrowMutexError(int aResult, const char* apCall) { OsThrowError<QNCOsException>(aResult, apCall); }
+void OsLockMutex(pthread_mutex_t& arMutex) {
+  const int lResult = pthread_mutex_lock(&arMutex);
+  if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_mutex_lock");
+}
+
+void OsUnlockMutex(pthread_mutex_t& arMutex) {
+  const int lResult = pthread_mutex_unlock(&arMutex);
+  if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_mutex_unlock");
+}
 
 void OsDestroyMutex(pthread_mutex_t& arMutex) {
   const int lResult = pthread_mutex_destroy(&arMutex);

@@ -3,14 +3,10 @@
 // the same time. A plain class: the system object's list services (QNCSystem::enlist, delist,
 // ...) delegate to the operations below.
 //
-// Locking: mMutex guards mList and mSpareNodes. Every element operation holds it for its own
-// duration only and never calls out while holding it: a new node is allocated before the lock is
-// taken, and an element that leaves the list is released after the lock is given up, so an
-// element's destructor may use this list again.
-//
-// Nodes are recycled: delist, delistBack and erase keep the emptied node (up to kSpareNodes of
-// them) and enlist and enlistFront reuse one before they allocate, so a steady hand-off through
-// the list allocates nothing and the producer never frees what the consumer allocated. Elements are handed out as new pointers that share the
+// Locking: mMutex guards mList. Every element operation holds it for its own duration only and
+// never calls out while holding it: a new node is allocated before the lock is taken, and an
+// element that leaves the list is released after the lock is given up, so an element's
+// destructor may use this list again. Elements are handed out as new pointers that share the
 // object, so a caller may keep using a delisted object while others change the list.
 //
 // begin(), end() and erase() are for a walk of the list. begin() and end() take no lock; the
@@ -34,11 +30,8 @@ class QNCSynchList {
   QNCSynchList& operator=(const QNCSynchList&) = delete;
   ~QNCSynchList();
 
-  // Most emptied nodes kept for reuse: the backlog of a busy hand-off, at a few KiB.
-  static constexpr unsigned int kSpareNodes = 256;
-
   // Add acrElement at the tail / at the head. Throw QNCNoMemoryEx "Out of Memory" (2) when no
-  // spare node is left and none can be allocated; the list is then unchanged.
+  // node can be allocated; the list is then unchanged.
   void enlist(const QNCPointer<QNCQueueable>& acrElement);
   void enlistFront(const QNCPointer<QNCQueueable>& acrElement);
 
@@ -51,7 +44,7 @@ class QNCSynchList {
   // the list is empty.
   QNCPointer<QNCQueueable> front();
 
-  // Removes every element (their nodes are freed, not kept).
+  // Removes every element.
   void clear();
   unsigned int numberOfElements();
   bool isEmpty();
@@ -66,14 +59,6 @@ class QNCSynchList {
   Elements::const_iterator end() const { return mList.end(); }
 
  private:
-  // With mMutex held: reuses a spare node for acrElement at the tail (front when aAtFront).
-  // False when there is none.
-  bool _enlistIntoSpare(const QNCPointer<QNCQueueable>& acrElement, bool aAtFront);
-  // With mMutex held: moves the element at aPosition out and keeps its node as a spare, or
-  // moves the node to arFreed (freed by the caller after the lock) when enough are kept.
-  QNCPointer<QNCQueueable> _take(Elements::iterator aPosition, Elements& arFreed);
-
   Elements mList;
-  QNCPointer<QNCMutex> mMutex;  // guards mList and mSpareNodes
-  Elements mSpareNodes;         // emptied nodes (every element an empty pointer)
+  QNCPointer<QNCMutex> mMutex;  // guards mList
 };

@@ -8,8 +8,6 @@
 // while nobody waits is lost, not remembered for a later wait. Timed waits measure against the
 // monotonic clock. None of the operations logs.
 
-#include <atomic>
-
 #include "Mutex.h"
 #include "Os.h"
 
@@ -23,22 +21,8 @@ class QNCConditional {
   virtual ~QNCConditional() { OsDestroyConditional(mCondition); }
 
   // Blocks until the calling thread holds the mutex (guards the awaited condition).
-  void lock() {
-    mMutex.lock();
-    mLockers.fetch_add(1, std::memory_order_seq_cst);
-  }
-  void unlock() {
-    mLockers.fetch_sub(1, std::memory_order_release);
-    mMutex.unlock();
-  }
-  // False only when no thread is between lock() and unlock(), waiting or not. A thread that has
-  // just made an awaited condition true outside the lock (in a structure with a lock of its own)
-  // and then gets false knows that every waiter tests the condition after the change, so it can
-  // skip passing through the lock before signal(). True is no promise that anyone waits.
-  bool hasLockers() const {
-    std::atomic_thread_fence(std::memory_order_seq_cst);
-    return mLockers.load(std::memory_order_relaxed) != 0;
-  }
+  void lock() { mMutex.lock(); }
+  void unlock() { mMutex.unlock(); }
 
   // The caller holds the mutex; it is released while the thread waits and held again on return.
   // Blocks until signalled (or woken spuriously).
@@ -56,5 +40,4 @@ class QNCConditional {
  private:
   QNCMutex mMutex;  // guards the condition the waiting threads test
   pthread_cond_t mCondition;
-  std::atomic<unsigned int> mLockers{0};  // threads between lock() and unlock()
 };

@@ -5,8 +5,6 @@
 
 #include <pthread.h>
 
-#include "Os.h"
-
 class QNCMutex {
  public:
   // Throws QNCOsException when the system cannot create the mutex.
@@ -19,9 +17,9 @@ class QNCMutex {
   virtual ~QNCMutex();
 
   // Blocks, as long as necessary, until the calling thread holds the mutex.
-  void lock() { OsLockMutex(mMutex); }
+  void lock();
   // The calling thread must hold the mutex.
-  void unlock() { OsUnlockMutex(mMutex); }
+  void unlock();
 
   // The system mutex, for QNCConditional to wait with.
   pthread_mutex_t& getMutex() { return mMutex; }

@@ -33,19 +33,10 @@ enum QNEFileLockStatus : unsigned char {
 
 // Initialises a mutex. Throws QNCOsException when the system has no resources for it.
 void OsInitMutex(pthread_mutex_t& arMutex);
-// Throws the QNCOsException "<apCall>: <error text>" for a failed lock or unlock: kept out of
-// line so that the inline lock and unlock below stay a call to pthread and a test.
-[[noreturn]] void OsThrowMutexError(int aResult, const char* apCall);
 // Blocks until the calling thread holds the mutex. Throws QNCOsException on a broken mutex.
-inline void OsLockMutex(pthread_mutex_t& arMutex) {
-  const int lResult = pthread_mutex_lock(&arMutex);
-  if (__builtin_expect(lResult != 0, 0)) OsThrowMutexError(lResult, "pthread_mutex_lock");
-}
+void OsLockMutex(pthread_mutex_t& arMutex);
 // Releases a mutex the calling thread holds. Throws QNCOsException on a broken mutex.
-inline void OsUnlockMutex(pthread_mutex_t& arMutex) {
-  const int lResult = pthread_mutex_unlock(&arMutex);
-  if (__builtin_expect(lResult != 0, 0)) OsThrowMutexError(lResult, "pthread_mutex_unlock");
-}
+void OsUnlockMutex(pthread_mutex_t& arMutex);
 // Destroys a mutex. Throws QNCOsException when the system refuses, for example with EBUSY for a
 // mutex that is still locked; the mutex is then left as it was.
 void OsDestroyMutex(pthread_mutex_t& arMutex);
