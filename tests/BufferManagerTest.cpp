@@ -1,12 +1,13 @@
 #include <gtest/gtest.h>
 
-#include <algorithm>
+#include <atomic>
 #include <cstring>
-#include <initializer_list>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <new>
 #include <set>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -22,23 +23,19 @@
 
 namespace {
 
-// A system object that only supplies the bucket list (and, on request, its manager).
+// A system object that only supplies the bucket list.
 class BucketSystem : public QNCSystem {
  public:
-  explicit BucketSystem(std::initializer_list<unsigned int> aLengths) {
-    for (const unsigned int lLength : aLengths) mMemoryBufferList.pushBack(lLength);
-  }
-  void installManager() {
-    mBufferManager = QNCPointer<QNCBufferManager>(new (std::nothrow) QNCBufferManager(this), QNPST_Individual,
-                                                  QNPAT_New);
+  explicit BucketSystem(const std::vector<unsigned int>& acrLengths) {
+    for (const unsigned int lLength : acrLengths) mMemoryBufferList.pushBack(lLength);
   }
   void setCommandLineArgumentDesc() override {}
   void parseConfigFile(QNCString&) override { throw QNCNotImplementedEx("no configuration file", 0); }
   void displayHelp() override {}
 };
 
-std::unique_ptr<QNCBufferManager> makeManager(std::initializer_list<unsigned int> aLengths) {
-  BucketSystem lSystem(aLengths);
+std::unique_ptr<QNCBufferManager> makeManager(const std::vector<unsigned int>& acrLengths) {
+  BucketSystem lSystem(acrLengths);
   return std::make_unique<QNCBufferManager>(&lSystem);
 }
 
@@ -46,6 +43,11 @@ QNCPointer<QNCBuffer> take(QNCBufferManager& arManager, unsigned int aLength) {
   QNCPointer<QNCBuffer> lBuffer;
   arManager.get(aLength, lBuffer);
   return lBuffer;
+}
+
+QNCPointer<QNCBuffer> foreignBuffer(unsigned int aLength) {
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, 0), QNPST_Individual,
+                               QNPAT_New);
 }
 
 // Every test writes its own log, so that its lines can be checked.
@@ -60,16 +62,10 @@ class BufferManagerTest : public ::testing::Test {
   // The lines of the log so far that contain acrText.
   std::vector<std::string> linesWith(const std::string& acrText) {
     flushLogger();
+    std::istringstream lLog(qntest::readFile(mDir.file("pool.log")));
     std::vector<std::string> lLines;
-    const std::string lLog = qntest::readFile(mDir.file("pool.log"));
-    size_t lStart = 0;
-    while (lStart < lLog.size()) {
-      size_t lEnd = lLog.find('\n', lStart);
-      if (lEnd == std::string::npos) lEnd = lLog.size();
-      const std::string lLine = lLog.substr(lStart, lEnd - lStart);
+    for (std::string lLine; std::getline(lLog, lLine);)
       if (lLine.find(acrText) != std::string::npos) lLines.push_back(lLine);
-      lStart = lEnd + 1;
-    }
     return lLines;
   }
 
@@ -77,24 +73,22 @@ class BufferManagerTest : public ::testing::Test {
 };
 
 // The bucket is visible as the capacity of a new buffer: the manager makes it with the bucket's
-// length as its maximum.
-TEST_F(BufferManagerTest, AscendingListGivesTheSmallestFittingBucket) {
-  auto lAscending = makeManager({64, 256, 1024});
-  EXPECT_EQ(64u, take(*lAscending, 1)->getCapacity());
-  EXPECT_EQ(64u, take(*lAscending, 64)->getCapacity());
-  EXPECT_EQ(256u, take(*lAscending, 65)->getCapacity());
-  EXPECT_EQ(1024u, take(*lAscending, 1024)->getCapacity());
+// length as its maximum. The first bucket that fits wins, so on an unsorted list a later, smaller
+// bucket is shadowed.
+TEST_F(BufferManagerTest, FirstFittingBucketGivesTheCapacity) {
+  const struct {
+    std::vector<unsigned int> mBuckets;
+    unsigned int mLength;
+    unsigned int mCapacity;
+  } kCases[] = {{{64, 256, 1024}, 1, 64},      {{64, 256, 1024}, 64, 64}, {{64, 256, 1024}, 65, 256},
+                {{64, 256, 1024}, 1024, 1024}, {{256, 64}, 10, 256},      {{256, 64}, 64, 256}};
+  for (const auto& lCase : kCases) {
+    EXPECT_EQ(lCase.mCapacity, take(*makeManager(lCase.mBuckets), lCase.mLength)->getCapacity())
+        << "length " << lCase.mLength << " from " << lCase.mBuckets.size() << " buckets";
+  }
 }
 
-TEST_F(BufferManagerTest, LaterBucketsThatFirstFitShadowsAreNeverUsed) {
-  // Unsorted: bucket 0 already fits everything up to 256, so bucket 1 is never chosen.
-  auto lUnsorted = makeManager({256, 64});
-  EXPECT_EQ(256u, take(*lUnsorted, 10)->getCapacity());
-  EXPECT_EQ(256u, take(*lUnsorted, 64)->getCapacity());
-  EXPECT_EQ(256u, take(*lUnsorted, 256)->getCapacity());
-  EXPECT_TRUE(linesWith("Determined bucket number is 1").empty());
-
-  // Duplicates: the later of two equal buckets is never chosen, on either side.
+TEST_F(BufferManagerTest, LaterOfTwoEqualBucketsIsNeverUsed) {
   auto lDuplicate = makeManager({128, 128});
   QNCPointer<QNCBuffer> lBuffer = take(*lDuplicate, 100);
   lDuplicate->reuse(lBuffer);
@@ -107,7 +101,6 @@ TEST_F(BufferManagerTest, LaterBucketsThatFirstFitShadowsAreNeverUsed) {
 TEST_F(BufferManagerTest, ReusedBufferComesBackWithItsOldBytesAndTheNewLength) {
   auto lManager = makeManager({64, 256});
   QNCPointer<QNCBuffer> lFirst = take(*lManager, 100);
-  EXPECT_EQ(100u, lFirst->getLength());
   EXPECT_EQ(256u, lFirst->getCapacity());
   memcpy(static_cast<unsigned char*>(*lFirst), "previous user", 13);
   QNCBuffer* const lObject = lFirst.get();
@@ -140,52 +133,32 @@ TEST_F(BufferManagerTest, IdleBuffersComeBackFirstInFirstOut) {
   EXPECT_TRUE(lNew.get() != lA.get() && lNew.get() != lB.get() && lNew.get() != lC.get());
 }
 
-TEST_F(BufferManagerTest, ReturnedBufferIsSortedByItsUsedLengthNotItsOrigin) {
-  auto lManager = makeManager({64, 256});
-  QNCPointer<QNCBuffer> lBuffer = take(*lManager, 200);
-  lBuffer->setLength(10);
-  lManager->reuse(lBuffer);
-  EXPECT_EQ(1u, linesWith("Queuing buffer to be reused in bucket # 0").size());
-
-  const QNCPointer<QNCBuffer> lSmall = take(*lManager, 50);
-  EXPECT_EQ(lBuffer.get(), lSmall.get());
-  EXPECT_EQ(256u, lSmall->getCapacity());
-  EXPECT_EQ(50u, lSmall->getLength());
-  // Bucket 1 lost it: a request there makes a new buffer.
-  EXPECT_NE(lBuffer.get(), take(*lManager, 200).get());
-}
-
-TEST_F(BufferManagerTest, UsedLengthAbove4096IsNeverPooled) {
+// reuse files a buffer by its used length, not by the bucket it came from, and keeps none whose
+// used length exceeds 4096; get has no such limit.
+TEST_F(BufferManagerTest, ReuseSortsByUsedLengthUpTo4096) {
   auto lManager = makeManager({64, 8192});
-  // get has no such limit: a bucket of 8192 serves 5000.
   QNCPointer<QNCBuffer> lLarge = take(*lManager, 5000);
   EXPECT_EQ(8192u, lLarge->getCapacity());
   lLarge->setLength(4097);
   lManager->reuse(lLarge);
   EXPECT_EQ(1u, linesWith("Buffer too big... Need not be reused").size());
-  EXPECT_TRUE(linesWith("Queuing buffer").empty());
   EXPECT_NE(lLarge.get(), take(*lManager, 4097).get());
 
-  // At exactly 4096 it is pooled.
   lLarge->setLength(4096);
   lManager->reuse(lLarge);
   EXPECT_EQ(lLarge.get(), take(*lManager, 4096).get());
+
+  lLarge->setLength(10);
+  lManager->reuse(lLarge);
+  EXPECT_EQ(1u, linesWith("Queuing buffer to be reused in bucket # 0").size());
+  EXPECT_EQ(lLarge.get(), take(*lManager, 50).get());
+  // Bucket 1 lost it: a request there makes a new buffer.
+  EXPECT_NE(lLarge.get(), take(*lManager, 5000).get());
 }
 
-TEST_F(BufferManagerTest, ReuseWithoutAFittingBucketLogsTwoErrorsAndReturns) {
-  auto lManager = makeManager({64, 1024});
-  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow) QNCAllocatedBuffer(4096, 0), QNPST_Individual, QNPAT_New);
-  EXPECT_NO_THROW(lManager->reuse(lBuffer));
-  const auto lSearch = linesWith("Failed to find a bucket for 4096 buffer size");
-  ASSERT_EQ(1u, lSearch.size());
-  EXPECT_NE(std::string::npos, lSearch[0].find("-E-"));
-  const auto lAbsorbed = linesWith("Failed to determine bucket no, error: Cannot find a buffer bucket");
-  ASSERT_EQ(1u, lAbsorbed.size());
-  EXPECT_NE(std::string::npos, lAbsorbed[0].find("-E-"));
-  EXPECT_EQ(4096u, lBuffer->getLength());
-}
-
-TEST_F(BufferManagerTest, GetWithoutAFittingBucketThrowsNoMemoryAndKeepsTheCallersBuffer) {
+// get without a fitting bucket fails the caller; reuse of a buffer that no bucket takes only
+// logs, since the caller is done with it anyway.
+TEST_F(BufferManagerTest, NoFittingBucketThrowsFromGetButOnlyLogsFromReuse) {
   auto lManager = makeManager({64, 256, 1024});
   QNCPointer<QNCBuffer> lBuffer = take(*lManager, 5);
   QNCBuffer* const lBefore = lBuffer.get();
@@ -198,27 +171,31 @@ TEST_F(BufferManagerTest, GetWithoutAFittingBucketThrowsNoMemoryAndKeepsTheCalle
     EXPECT_EQ(2u, acrException.getCode());
   }
   EXPECT_EQ(lBefore, lBuffer.get());
-  const auto lErrors = linesWith("-E-");
-  ASSERT_EQ(2u, lErrors.size());
-  EXPECT_NE(std::string::npos, lErrors[0].find("Failed to find a bucket for 1025 buffer size"));
-  EXPECT_NE(std::string::npos, lErrors[1].find("Cannot allocate a buffer"));
   EXPECT_EQ(lLocksBefore, linesWith("Locking bucket").size());  // no lock was taken
   // The failure left no bucket locked.
   EXPECT_EQ(1024u, take(*lManager, 1024)->getCapacity());
+
+  QNCPointer<QNCBuffer> lForeign = foreignBuffer(4096);
+  EXPECT_NO_THROW(lManager->reuse(lForeign));
+  const auto lErrors = linesWith("-E-");
+  ASSERT_EQ(4u, lErrors.size());
+  EXPECT_NE(std::string::npos, lErrors[0].find("Failed to find a bucket for 1025 buffer size"));
+  EXPECT_NE(std::string::npos, lErrors[1].find("Cannot allocate a buffer"));
+  EXPECT_NE(std::string::npos, lErrors[2].find("Failed to find a bucket for 4096 buffer size"));
+  EXPECT_NE(std::string::npos,
+            lErrors[3].find("Failed to determine bucket no, error: Cannot find a buffer bucket"));
 }
 
 TEST_F(BufferManagerTest, ForeignBufferTooSmallForItsBucketIsNeverHandedOut) {
   auto lManager = makeManager({64, 256});
   // A message buffer: capacity equals its used length. 100 bytes would sort into bucket 1.
-  QNCPointer<QNCBuffer> lMessage(new (std::nothrow) QNCAllocatedBuffer(100, 0), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCBuffer> lMessage = foreignBuffer(100);
   lManager->reuse(lMessage);
   EXPECT_TRUE(linesWith("Queuing buffer").empty());
-  const QNCPointer<QNCBuffer> lServed = take(*lManager, 256);
-  EXPECT_NE(lMessage.get(), lServed.get());
-  EXPECT_EQ(256u, lServed->getLength());
+  EXPECT_NE(lMessage.get(), take(*lManager, 256).get());
 
   // One whose capacity reaches its bucket's length is pooled like any other.
-  QNCPointer<QNCBuffer> lExact(new (std::nothrow) QNCAllocatedBuffer(64, 0), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCBuffer> lExact = foreignBuffer(64);
   lManager->reuse(lExact);
   EXPECT_EQ(lExact.get(), take(*lManager, 64).get());
 }
@@ -238,24 +215,6 @@ TEST_F(BufferManagerTest, DestructionReportsTheUsedLengthsOfIdleBuffers) {
   EXPECT_EQ(10u, lA->getLength());
 }
 
-TEST_F(BufferManagerTest, SystemServicesReachTheManager) {
-  BucketSystem lSystem({64, 256});
-  lSystem.installManager();
-  QNCPointer<QNCBuffer> lBuffer;
-  lSystem.getBuffer(100, lBuffer);
-  EXPECT_EQ(256u, lBuffer->getCapacity());
-  QNCBuffer* const lObject = lBuffer.get();
-  lSystem.reuseBuffer(lBuffer);
-  QNCPointer<QNCBuffer> lAgain;
-  lSystem.getBuffer(150, lAgain);
-  EXPECT_EQ(lObject, lAgain.get());
-  lSystem.clearBuffer(lAgain);  // the same operation as reuseBuffer
-  lSystem.getBuffer(30, lAgain);
-  EXPECT_NE(lObject, lAgain.get());  // 150 went back to bucket 1
-  lSystem.getBuffer(256, lAgain);
-  EXPECT_EQ(lObject, lAgain.get());
-}
-
 // Threads take and return buffers of every bucket, also lowering the used length so buffers
 // move between buckets. A buffer handed to two threads at once, or lost, must show.
 TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
@@ -267,9 +226,9 @@ TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
 
   std::mutex lGuard;  // guards lOut and lSeen
   std::set<QNCBuffer*> lOut;
-  std::vector<QNCPointer<QNCBuffer>> lSeen;  // every distinct buffer, kept alive so addresses stay unique
-  std::set<QNCBuffer*> lSeenSet;
-  std::vector<unsigned int> lFailures(kThreads, 0);
+  // Every distinct buffer, kept alive so addresses stay unique.
+  std::map<QNCBuffer*, QNCPointer<QNCBuffer>> lSeen;
+  std::atomic<unsigned int> lFailures{0};
 
   std::vector<std::thread> lThreads;
   for (unsigned int lThread = 0; lThread < kThreads; ++lThread) {
@@ -280,15 +239,15 @@ TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
         lManager->get(lLength, lBuffer);
         {
           std::lock_guard<std::mutex> lLock(lGuard);
-          if (!lOut.insert(lBuffer.get()).second) ++lFailures[lThread];
-          if (lSeenSet.insert(lBuffer.get()).second) lSeen.push_back(lBuffer);
+          if (!lOut.insert(lBuffer.get()).second) ++lFailures;
+          lSeen.emplace(lBuffer.get(), lBuffer);
         }
         const unsigned char lMark = static_cast<unsigned char>(lThread * 31 + lRound);
         memset(static_cast<unsigned char*>(*lBuffer), lMark, lLength);
         std::this_thread::yield();
         for (unsigned int lIndex = 0; lIndex < lLength; ++lIndex)
           if (lBuffer->byte(lIndex) != lMark) {
-            ++lFailures[lThread];
+            ++lFailures;
             break;
           }
         if (lRound % 5 == 0) lBuffer->setLength(lLength / 2);
@@ -301,30 +260,30 @@ TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
     });
   }
   for (std::thread& lThread : lThreads) lThread.join();
-  for (unsigned int lThread = 0; lThread < kThreads; ++lThread) EXPECT_EQ(0u, lFailures[lThread]);
+  EXPECT_EQ(0u, lFailures.load());
 
   // Drain every bucket until it makes a new buffer: each buffer ever seen comes back exactly once.
-  std::multiset<QNCBuffer*> lDrained;
+  std::set<QNCBuffer*> lDrained;
   for (const unsigned int lLength : lLengths) {
     for (;;) {
       QNCPointer<QNCBuffer> lBuffer = take(*lManager, lLength);
-      if (lSeenSet.count(lBuffer.get()) == 0) break;
-      lDrained.insert(lBuffer.get());
+      if (lSeen.count(lBuffer.get()) == 0) break;
+      EXPECT_TRUE(lDrained.insert(lBuffer.get()).second) << "a buffer was pooled twice";
     }
   }
   EXPECT_EQ(lSeen.size(), lDrained.size());
-  EXPECT_EQ(lSeenSet.size(), std::set<QNCBuffer*>(lDrained.begin(), lDrained.end()).size());
   setLogCode(255);
 }
 
-using BufferManagerDeathTest = ::testing::Test;
-
 TEST(BufferManagerDeathTest, BrokenBucketSetupsAssert) {
-  EXPECT_EXIT(makeManager({}), ::testing::ExitedWithCode(1), "Assertion \\[ lBufferList.size\\(\\) > 0 \\] failed");
+  EXPECT_EXIT(makeManager({}), ::testing::ExitedWithCode(1),
+              "Assertion \\[ lBufferList.size\\(\\) > 0 \\] failed");
   // Only a request for 0 can reach a bucket of length 0.
-  EXPECT_EXIT(take(*makeManager({0, 64}), 0), ::testing::ExitedWithCode(1), "Assertion \\[ 0 != lBufferSize \\] failed");
+  EXPECT_EXIT(take(*makeManager({0, 64}), 0), ::testing::ExitedWithCode(1),
+              "Assertion \\[ 0 != lBufferSize \\] failed");
   // Bucket 0 is empty, so get(0) makes a buffer of used length 0.
-  EXPECT_EXIT(take(*makeManager({64}), 0), ::testing::ExitedWithCode(1), "Assertion \\[ acUseLength != 0 \\] failed");
+  EXPECT_EXIT(take(*makeManager({64}), 0), ::testing::ExitedWithCode(1),
+              "Assertion \\[ acUseLength != 0 \\] failed");
 }
 
 }  // namespace

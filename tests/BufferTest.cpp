@@ -1,6 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <cstring>
 #include <new>
 
 #include "AllocatedBuffer.h"
@@ -11,33 +10,28 @@
 namespace {
 
 QNCPointer<QNCBuffer> makeBuffer(unsigned int aUseLength, unsigned int aMaxLength) {
-  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aUseLength, aMaxLength), QNPST_Individual,
-                               QNPAT_New);
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aUseLength, aMaxLength),
+                               QNPST_Individual, QNPAT_New);
 }
 
-TEST(BufferTest, ZeroMaximumMakesRoomForExactlyTheUsedLength) {
-  QNCPointer<QNCBuffer> lBuffer = makeBuffer(10, 0);
-  EXPECT_EQ(10u, lBuffer->getLength());
-  EXPECT_EQ(10u, lBuffer->getCapacity());
-  memset(static_cast<unsigned char*>(*lBuffer), 0x5a, 10);
-  EXPECT_EQ(0x5a, lBuffer->byte(9));
-}
-
-TEST(BufferTest, UsedLengthGrowsUpToTheMaximumAndEveryByteIsWritable) {
+TEST(BufferTest, UsedLengthMovesWithinTheCapacityAndTheBytesStay) {
+  // A maximum of 0 makes room for exactly the used length.
+  EXPECT_EQ(10u, makeBuffer(10, 0)->getCapacity());
   QNCPointer<QNCBuffer> lBuffer = makeBuffer(10, 64);
   EXPECT_EQ(10u, lBuffer->getLength());
   lBuffer->setLength(64);
   unsigned char* lBytes = *lBuffer;
-  for (unsigned int lIndex = 0; lIndex < 64; ++lIndex) lBytes[lIndex] = static_cast<unsigned char>(lIndex);
-  const QNCBuffer& lReadOnly = *lBuffer;
-  const unsigned char* lRead = lReadOnly;
-  EXPECT_EQ(lBytes, lRead);
-  EXPECT_EQ(63, lBuffer->byte(63));
-  EXPECT_EQ(64u, lBuffer->getLength());
+  for (unsigned int lIndex = 0; lIndex < 64; ++lIndex)
+    lBytes[lIndex] = static_cast<unsigned char>(lIndex + 1);
+  EXPECT_EQ(64, lBuffer->byte(63));
+  // Shrinking to nothing and growing back keeps the bytes: the storage never moves.
+  lBuffer->setLength(0);
+  lBuffer->setLength(1);
+  EXPECT_EQ(1, lBuffer->byte(0));
 }
 
-TEST(BufferTest, LengthBeyondCapacityIsRefusedAndLeavesTheLengthAlone) {
-  QNCPointer<QNCBuffer> lBuffer = makeBuffer(10, 64);
+TEST(BufferTest, LengthBeyondCapacityAndBytesBeyondTheUsedLengthAreRefused) {
+  QNCPointer<QNCBuffer> lBuffer = makeBuffer(4, 64);
   try {
     lBuffer->setLength(65);
     FAIL() << "setLength beyond the capacity was accepted";
@@ -45,16 +39,7 @@ TEST(BufferTest, LengthBeyondCapacityIsRefusedAndLeavesTheLengthAlone) {
     EXPECT_STREQ("Buffer length beyond its capacity", acrException.what());
     EXPECT_EQ(6u, acrException.getCode());
   }
-  EXPECT_EQ(10u, lBuffer->getLength());
-  // Shrinking to nothing and growing back keeps the bytes: the storage never moves.
-  (*lBuffer)[0] = 'q';
-  lBuffer->setLength(0);
-  lBuffer->setLength(1);
-  EXPECT_EQ('q', lBuffer->byte(0));
-}
-
-TEST(BufferTest, ByteIsReadOnlyInsideTheUsedLength) {
-  QNCPointer<QNCBuffer> lBuffer = makeBuffer(4, 64);
+  EXPECT_EQ(4u, lBuffer->getLength());
   (*lBuffer)[3] = 7;
   EXPECT_EQ(7, lBuffer->byte(3));
   // Index 4 lies inside the storage but beyond the contents.
@@ -69,17 +54,15 @@ TEST(BufferTest, LocalBufferHoldsACopyOfTheBytesInMemoryOrder) {
       new (std::nothrow) QNCLocalBuffer(reinterpret_cast<const unsigned char*>(&lValue), sizeof lValue),
       QNPST_Individual, QNPAT_New);
   EXPECT_EQ(4u, lBuffer->getLength());
-  EXPECT_EQ(0, memcmp(&lValue, static_cast<const unsigned char*>(*lBuffer), 4));
   lValue = 0;  // the buffer does not refer to the caller's bytes
   EXPECT_EQ(0x01, lBuffer->byte(0));
   EXPECT_EQ(0x04, lBuffer->byte(3));
 }
 
-using BufferDeathTest = ::testing::Test;
-
 TEST(BufferDeathTest, AllocatedBufferAssertsItsLengths) {
   EXPECT_EXIT(makeBuffer(0, 64), ::testing::ExitedWithCode(1),
-              "QNCAllocatedBuffer \\(common/include/AllocatedBuffer.h:[0-9]+\\) Assertion \\[ acUseLength != 0 \\] failed");
+              "QNCAllocatedBuffer \\(common/include/AllocatedBuffer.h:[0-9]+\\) Assertion \\[ acUseLength != "
+              "0 \\] failed");
   EXPECT_EXIT(makeBuffer(65, 64), ::testing::ExitedWithCode(1),
               "Assertion \\[ acMaxLength == 0 \\|\\| acUseLength <= acMaxLength \\] failed");
   // The limit itself is valid.

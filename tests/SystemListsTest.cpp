@@ -21,38 +21,24 @@ class SystemListsTest : public ::testing::Test {
 
 std::vector<int> walk(const QNCSystem& acrSystem, unsigned int aList) {
   std::vector<int> lIds;
-  for (auto lIt = acrSystem.listBegin(aList); lIt != acrSystem.listEnd(aList); ++lIt) lIds.push_back(idOf(*lIt));
+  for (auto lIt = acrSystem.listBegin(aList); lIt != acrSystem.listEnd(aList); ++lIt)
+    lIds.push_back(idOf(*lIt));
   return lIds;
 }
 
-TEST_F(SystemListsTest, EnlistFrontPutsAheadOfEarlierElements) {
+TEST_F(SystemListsTest, EnlistFrontAndDelistBackWorkAtTheOtherEnd) {
   mSystem.enlist(0, makeItem(1));
   mSystem.enlist(0, makeItem(2));
   mSystem.enlistFront(0, makeItem(3));
+  mSystem.enlist(1, makeItem(4));  // lists with different numbers are independent
+  EXPECT_EQ((std::vector<int>{3, 1, 2}), walk(mSystem, 0));
   EXPECT_EQ(3, idOf(mSystem.listFront(0)));
   EXPECT_EQ(3u, mSystem.listSize(0));  // listFront copies, it does not remove
-  EXPECT_EQ(3, idOf(mSystem.delist(0)));
-  EXPECT_EQ(1, idOf(mSystem.delist(0)));
-  EXPECT_EQ(2, idOf(mSystem.delist(0)));
-  EXPECT_TRUE(mSystem.isListEmpty(0));
-}
-
-TEST_F(SystemListsTest, DelistBackTakesFromTheTail) {
-  mSystem.enlist(0, makeItem(1));
-  mSystem.enlist(0, makeItem(2));
-  mSystem.enlistFront(0, makeItem(3));
   EXPECT_EQ(2, idOf(mSystem.delistBack(0)));
+  EXPECT_EQ(3, idOf(mSystem.delist(0)));
   EXPECT_EQ(1, idOf(mSystem.delistBack(0)));
-  EXPECT_EQ(3, idOf(mSystem.delistBack(0)));
-  EXPECT_EQ(0u, mSystem.listSize(0));
-}
-
-TEST_F(SystemListsTest, ListsWithDifferentNumbersAreIndependent) {
-  mSystem.enlist(0, makeItem(1));
-  mSystem.enlist(1, makeItem(2));
-  EXPECT_EQ(2, idOf(mSystem.delist(1)));
-  EXPECT_TRUE(mSystem.isListEmpty(1));
-  EXPECT_EQ(1u, mSystem.listSize(0));
+  EXPECT_TRUE(mSystem.isListEmpty(0));
+  EXPECT_EQ((std::vector<int>{4}), walk(mSystem, 1));
 }
 
 // Each removal on an empty list must release the list's lock on its way out: the enlist that
@@ -68,34 +54,13 @@ TEST_F(SystemListsTest, RemovingFromEmptyListThrowsNotFoundAndLeavesItUsable) {
       EXPECT_STREQ("Not Found", acrException.what());
       EXPECT_EQ(8u, acrException.getCode());
     }
-    ASSERT_TRUE(qntest::returnsWithin([&] { mSystem.enlist(0, makeItem(lRound)); }, std::chrono::seconds(10)));
+    ASSERT_TRUE(
+        qntest::returnsWithin([&] { mSystem.enlist(0, makeItem(lRound)); }, std::chrono::seconds(10)));
     EXPECT_EQ(lRound, idOf(mSystem.delist(0)));
   }
 }
 
-TEST_F(SystemListsTest, ClearEmptiesTheList) {
-  for (int lId = 0; lId < 3; ++lId) mSystem.enlist(0, makeItem(lId));
-  EXPECT_EQ(3u, mSystem.listSize(0));
-  EXPECT_FALSE(mSystem.isListEmpty(0));
-  mSystem.listClear(0);
-  EXPECT_EQ(0u, mSystem.listSize(0));
-  EXPECT_TRUE(mSystem.isListEmpty(0));
-  mSystem.enlist(0, makeItem(7));
-  EXPECT_EQ(7, idOf(mSystem.delist(0)));
-}
-
-TEST_F(SystemListsTest, EraseMovesTheIteratorToTheNextElement) {
-  mSystem.enlist(0, makeItem(1));
-  mSystem.enlist(0, makeItem(2));
-  auto lIt = mSystem.listBegin(0);
-  mSystem.listErase(0, lIt);
-  ASSERT_TRUE(lIt != mSystem.listEnd(0));
-  EXPECT_EQ(2, idOf(*lIt));
-  mSystem.listErase(0, lIt);
-  EXPECT_TRUE(lIt == mSystem.listEnd(0));
-  EXPECT_TRUE(mSystem.isListEmpty(0));
-}
-
+// listErase moves the iterator to the next element, and to the end after the last one.
 TEST_F(SystemListsTest, WalkThatErasesEveryOtherElementKeepsTheRestInOrder) {
   for (int lId = 0; lId < 7; ++lId) mSystem.enlist(0, makeItem(lId));
   for (auto lIt = mSystem.listBegin(0); lIt != mSystem.listEnd(0);) {
@@ -109,31 +74,22 @@ TEST_F(SystemListsTest, WalkThatErasesEveryOtherElementKeepsTheRestInOrder) {
   EXPECT_EQ(3u, mSystem.listSize(0));
 }
 
-TEST_F(SystemListsTest, DelistedObjectLivesWhileHeldAndIsDestroyedExactlyOnce) {
-  std::atomic<int> lDestroyed{0};
-  mSystem.enlist(0, makeItem(1, &lDestroyed));  // the list is now the only holder
-  EXPECT_EQ(0, lDestroyed.load());
-  QNCPointer<QNCQueueable> lTaken = mSystem.delist(0);
-  QNCPointer<QNCQueueable> lShared = lTaken;
-  EXPECT_EQ(0, lDestroyed.load());
-  mSystem.enlist(0, makeItem(2));
-  mSystem.listClear(0);  // changing the list does not touch the delisted object
-  EXPECT_EQ(1, idOf(lShared));
-  lTaken.reset();
-  EXPECT_EQ(0, lDestroyed.load());
-  lShared.reset();
-  EXPECT_EQ(1, lDestroyed.load());
-}
-
-TEST_F(SystemListsTest, EveryWayOutOfTheListReleasesItsReferenceOnce) {
+TEST_F(SystemListsTest, EveryWayOutReleasesTheListsReferenceExactlyOnce) {
   std::atomic<int> lDestroyed{0};
   for (int lId = 0; lId < 6; ++lId) mSystem.enlist(0, makeItem(lId, &lDestroyed));
-  mSystem.delist(0);
+  QNCPointer<QNCQueueable> lTaken = mSystem.delist(0);
   mSystem.delistBack(0);
   auto lIt = mSystem.listBegin(0);
   mSystem.listErase(0, lIt);
-  EXPECT_EQ(3, lDestroyed.load());
+  EXPECT_EQ(2, lDestroyed.load());  // the delisted object lives while it is held
   mSystem.listClear(0);
+  EXPECT_TRUE(mSystem.isListEmpty(0));
+  EXPECT_EQ(5, lDestroyed.load());
+  EXPECT_EQ(0, idOf(lTaken));
+  QNCPointer<QNCQueueable> lShared = lTaken;
+  lTaken.reset();
+  EXPECT_EQ(5, lDestroyed.load());
+  lShared.reset();
   EXPECT_EQ(6, lDestroyed.load());
 }
 
@@ -141,7 +97,8 @@ TEST_F(SystemListsTest, EveryWayOutOfTheListReleasesItsReferenceOnce) {
 // lock while the element is destroyed, or the destructor would deadlock on it.
 class Reenlisting : public QNCQueueable {
  public:
-  Reenlisting(QNCSystem& arSystem, std::atomic<int>& arDestroyed) : mSystem(arSystem), mDestroyed(arDestroyed) {}
+  Reenlisting(QNCSystem& arSystem, std::atomic<int>& arDestroyed)
+      : mSystem(arSystem), mDestroyed(arDestroyed) {}
   ~Reenlisting() override {
     mDestroyed.fetch_add(1);
     mSystem.enlist(0, makeItem(99));
@@ -154,7 +111,9 @@ class Reenlisting : public QNCQueueable {
 
 TEST_F(SystemListsTest, ElementsAreDestroyedOutsideTheListLock) {
   std::atomic<int> lDestroyed{0};
-  auto lReenlisting = [&] { return QNCPointer<QNCQueueable>(new (std::nothrow) Reenlisting(mSystem, lDestroyed)); };
+  auto lReenlisting = [&] {
+    return QNCPointer<QNCQueueable>(new (std::nothrow) Reenlisting(mSystem, lDestroyed));
+  };
   const bool lReturned = qntest::returnsWithin(
       [&] {
         mSystem.enlist(0, lReenlisting());

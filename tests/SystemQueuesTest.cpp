@@ -16,8 +16,9 @@ class SystemQueuesTest : public ::testing::Test {
   qntest::TableSystem mSystem{1, 2, 0};
 };
 
-TEST_F(SystemQueuesTest, ElementsLeaveInTheOrderTheyCame) {
+TEST_F(SystemQueuesTest, ElementsLeaveTheirOwnQueueInTheOrderTheyCame) {
   for (int lId = 1; lId <= 3; ++lId) mSystem.enqueue(0, makeItem(lId));
+  mSystem.enqueue(1, makeItem(5));
   EXPECT_EQ(1, idOf(mSystem.queueFront(0)));
   EXPECT_EQ(1, idOf(mSystem.dequeue(0)));  // queueFront left the head in place
   EXPECT_EQ(2, idOf(mSystem.dequeue(0)));
@@ -25,12 +26,6 @@ TEST_F(SystemQueuesTest, ElementsLeaveInTheOrderTheyCame) {
   EXPECT_EQ(3, idOf(mSystem.dequeue(0)));
   EXPECT_EQ(4, idOf(mSystem.dequeue(0)));
   EXPECT_TRUE(mSystem.isQueueEmpty(0));
-}
-
-TEST_F(SystemQueuesTest, QueuesWithDifferentNumbersAreIndependent) {
-  mSystem.enqueue(1, makeItem(5));
-  EXPECT_TRUE(mSystem.isQueueEmpty(0));
-  EXPECT_FALSE(mSystem.isQueueEmpty(1));
   EXPECT_EQ(5, idOf(mSystem.dequeue(1)));
 }
 
@@ -44,27 +39,26 @@ TEST_F(SystemQueuesTest, TakingFromAnEmptyQueueThrowsNotFoundAndLeavesItUsable) 
       EXPECT_STREQ("Not Found", acrException.what());
       EXPECT_EQ(8u, acrException.getCode());
     }
-    ASSERT_TRUE(qntest::returnsWithin([&] { mSystem.enqueue(0, makeItem(lRound)); }, std::chrono::seconds(10)));
+    ASSERT_TRUE(
+        qntest::returnsWithin([&] { mSystem.enqueue(0, makeItem(lRound)); }, std::chrono::seconds(10)));
     EXPECT_EQ(lRound, idOf(mSystem.dequeue(0)));
   }
 }
 
-TEST_F(SystemQueuesTest, ClearReleasesEveryElementOnce) {
+TEST_F(SystemQueuesTest, DequeueHandsOverAndClearReleasesEachReferenceOnce) {
   std::atomic<int> lDestroyed{0};
-  QNCPointer<QNCQueueable> lKept = makeItem(1, &lDestroyed);
-  mSystem.enqueue(0, lKept);
+  const QNCPointer<QNCQueueable> lKept = makeItem(3, &lDestroyed);
+  mSystem.enqueue(0, makeItem(1, &lDestroyed));
   mSystem.enqueue(0, makeItem(2, &lDestroyed));
-  mSystem.enqueue(0, makeItem(3, &lDestroyed));
+  mSystem.enqueue(0, lKept);
+  QNCPointer<QNCQueueable> lTaken = mSystem.dequeue(0);
   mSystem.queueClear(0);
   EXPECT_TRUE(mSystem.isQueueEmpty(0));
-  EXPECT_EQ(2, lDestroyed.load());
-  EXPECT_EQ(1, idOf(lKept));  // still shared with this test
-  QNCPointer<QNCQueueable> lTaken = makeItem(4, &lDestroyed);
-  mSystem.enqueue(0, lTaken);
-  lTaken = mSystem.dequeue(0);
-  EXPECT_EQ(2, lDestroyed.load());
+  EXPECT_EQ(1, lDestroyed.load());  // the two still held by this test survive
+  EXPECT_EQ(1, idOf(lTaken));
+  EXPECT_EQ(3, idOf(lKept));
   lTaken.reset();
-  EXPECT_EQ(3, lDestroyed.load());
+  EXPECT_EQ(2, lDestroyed.load());
 }
 
 // An element whose destructor uses the queue it leaves: the queue must not hold its lock while
