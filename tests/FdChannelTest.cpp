@@ -169,15 +169,13 @@ TEST(FdChannelTest, WriterDisablesNagleOnTcpSockets) {
   socklen_t lLength = sizeof lAddress;
   ASSERT_EQ(0, getsockname(lListener, reinterpret_cast<sockaddr*>(&lAddress), &lLength));
   const int lClient = socket(AF_INET, SOCK_STREAM, 0);
+  // Loopback connects complete against the listener's backlog; nobody needs to accept.
   ASSERT_EQ(0, connect(lClient, reinterpret_cast<sockaddr*>(&lAddress), sizeof lAddress));
-  const int lServer = accept(lListener, nullptr, nullptr);
-  ASSERT_GE(lServer, 0);
   QNCFdWriter lWriter(lClient);
   int lNoDelay = 0;
   socklen_t lSize = sizeof lNoDelay;
   ASSERT_EQ(0, getsockopt(lClient, IPPROTO_TCP, TCP_NODELAY, &lNoDelay, &lSize));
   EXPECT_NE(0, lNoDelay);
-  close(lServer);
   close(lListener);
 }
 

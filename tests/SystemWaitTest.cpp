@@ -1,6 +1,6 @@
 // Waiting on the system object's numbered conditionals, alone and paired with queues and lists:
-// wake-ups, time-outs, locks released on every way out, the shut-down pattern, and a stress run
-// of many producers and consumers.
+// wake-ups, time-outs, locks released on every way out, and a stress run of many producers and
+// consumers.
 
 #include <gtest/gtest.h>
 
@@ -61,6 +61,8 @@ class SystemWaitTest : public ::testing::Test {
 };
 
 TEST_F(SystemWaitTest, WaitAndTimedWaitReturnOnlyAfterASignal) {
+  // A time-out first: the conditional must still serve the waits that follow.
+  EXPECT_THROW(mSystem.timedWait(0, 20), QNCTimeOutEx);
   const std::function<void()> lWaits[] = {[&] { mSystem.wait(0); }, [&] { mSystem.timedWait(0, 20000); }};
   for (const auto& lWait : lWaits) {
     std::atomic<bool> lReturned{false};
