@@ -32,8 +32,6 @@ TEST(StringTest, EqualityAndOrderCompareTheWholeText) {
   }
   const QNCString lDefault;
   EXPECT_TRUE(lDefault.isEmpty());
-  EXPECT_TRUE(QNCString("").isEmpty());
-  EXPECT_STREQ("", QNCString("").get());
   EXPECT_TRUE(QNCString("") == lDefault);
   EXPECT_FALSE(QNCString("x").isEmpty());
 }
