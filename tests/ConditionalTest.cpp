@@ -32,9 +32,10 @@ TEST(ConditionalTest, TimedWaitNobodySignalsThrowsAfterTheTimeWithTheMutexHeld) 
   OsLockMutex(lMutex);
   OsSignal(lCondition);
   const auto lStart = Clock::now();
-  EXPECT_EQ("pthread_cond_timedwait: timed out after 200 ms (code " + std::to_string(ETIMEDOUT) + ")",
-            qntest::thrown<QNCTimeOutEx>([&] { OsConditionalTimedWait(lCondition, lMutex, 200); }, true));
+  const std::string lThrown =
+      qntest::thrown<QNCTimeOutEx>([&] { OsConditionalTimedWait(lCondition, lMutex, 200); }, true);
   const auto lElapsed = Clock::now() - lStart;
+  EXPECT_NE(std::string::npos, lThrown.find(" (code " + std::to_string(ETIMEDOUT) + ")")) << lThrown;
   EXPECT_GE(lElapsed, milliseconds(200));
   EXPECT_LT(lElapsed, milliseconds(200) + kMuchLater);
   // An ordinary mutex refuses a second lock even to the thread that holds it.

@@ -156,6 +156,19 @@ TEST_F(PointerTest, BasePointerDestroysTheDerivedObject) {
   EXPECT_EQ((std::vector<int>{-7, 7}), QNSTracked::sDestroyed);
 }
 
+// A move hands the reference over without counting: the source is empty afterwards, so the target
+// is the last reference. A move that copied would keep the object alive after the target's reset.
+TEST_F(PointerTest, MoveHandsOverTheReferenceAndEmptiesTheSource) {
+  QNCPointer<QNSTracked> lSource = make(1);
+  QNCPointer<QNSTracked> lTarget(std::move(lSource));
+  EXPECT_TRUE(lSource.isNull());  // NOLINT: the moved-from state is part of the contract
+  QNCPointer<QNSTracked> lOther = make(2);
+  lOther = std::move(lTarget);
+  EXPECT_TRUE(lTarget.isNull());  // NOLINT: as above
+  lOther.reset();
+  EXPECT_EQ((std::vector<int>{2, 1}), QNSTracked::sDestroyed);
+}
+
 // Copies released at the same time on many threads: a counter that is not atomic loses updates
 // and destroys the object twice or never.
 TEST_F(PointerTest, CopiesReleasedOnManyThreadsDestroyTheObjectOnce) {
@@ -187,6 +200,10 @@ TEST_F(PointerTest, CopiesReleasedOnManyThreadsDestroyTheObjectOnce) {
   }
 }
 
+// Empty pointers for the misuse cases.
+const QNCPointer<int> gsEmpty;
+const QNCPointer<QNSTracked> gsEmptyTracked;
+
 // Copying or assigning from an empty pointer, "->" on an array and dereferencing an empty pointer
 // are programming errors: each must stop the process with the assertion's line and status 1
 // rather than crash or go on with a null object.
@@ -195,32 +212,16 @@ TEST(PointerDeathTest, MisuseIsAnAssertion) {
     std::function<void()> mMisuse;
     const char* mCondition;
   } lCases[] = {
+      {[] { QNCPointer<int> lCopy(gsEmpty); }, "0 != acrCopy.mPointer"},
       {[] {
-         QNCPointer<int> lEmpty;
-         QNCPointer<int> lCopy(lEmpty);
-       },
-       "0 != acrCopy.mPointer"},
-      {[] {
-         QNCPointer<int> lEmpty;
          QNCPointer<int> lTarget(new (std::nothrow) int(3), QNPST_Individual, QNPAT_New);
-         lTarget = lEmpty;
+         lTarget = gsEmpty;
        },
        "0 != acrCopy.mPointer"},
-      {[] {
-         QNCPointer<QNSTracked> lArray(new QNSTracked[2], QNPST_Array, QNPAT_New);
-         (void)lArray->mId;
-       },
+      {[] { (void)QNCPointer<QNSTracked>(new QNSTracked[2], QNPST_Array, QNPAT_New)->mId; },
        "QNPST_Individual == mSizeType"},
-      {[] {
-         QNCPointer<QNSTracked> lEmpty;
-         (void)lEmpty->mId;
-       },
-       "0 != mPointer"},
-      {[] {
-         QNCPointer<int> lEmpty;
-         (void)*lEmpty;
-       },
-       "0 != mPointer"},
+      {[] { (void)gsEmptyTracked->mId; }, "0 != mPointer"},
+      {[] { (void)*gsEmpty; }, "0 != mPointer"},
   };
   for (const auto& lrCase : lCases) {
     EXPECT_EXIT(lrCase.mMisuse(), ::testing::ExitedWithCode(1), qntest::assertionFailure(lrCase.mCondition));
