@@ -1,9 +1,8 @@
 #include <gtest/gtest.h>
 
-#include <new>
+#include <memory>
 #include <string>
 
-#include "Pointer.h"
 #include "QNException.h"
 #include "QNQueue.h"
 #include "QNString.h"
@@ -11,20 +10,29 @@
 
 namespace {
 
-struct Tracked {
-  explicit Tracked(bool& arDestroyed) : mDestroyed(arDestroyed) {}
-  ~Tracked() { mDestroyed = true; }
-  bool& mDestroyed;
+// A recyclable element (nothrow default construction and moves) whose moves copy, so a moved-from
+// element still holds its reference: only a node emptied after the dequeue lets the reference go.
+// (A QNCPointer would not do: moving it out already empties the node.)
+struct QNSSticky {
+  QNSSticky() noexcept = default;
+  explicit QNSSticky(const std::shared_ptr<int>& acrValue) noexcept : mValue(acrValue) {}
+  QNSSticky(const QNSSticky&) = default;
+  QNSSticky(QNSSticky&& arOther) noexcept : mValue(arOther.mValue) {}
+  QNSSticky& operator=(const QNSSticky&) = default;
+  QNSSticky& operator=(QNSSticky&& arOther) noexcept {
+    mValue = arOther.mValue;
+    return *this;
+  }
+  std::shared_ptr<int> mValue;
 };
 
 // A recycled node must not keep the element it once held alive.
 TEST(QueueTest, DequeuedElementIsReleasedWithItsLastOutsideReference) {
-  QNCQueue<QNCPointer<Tracked>> lQueue;
-  bool lDestroyed = false;
-  lQueue.enqueue(QNCPointer<Tracked>(new (std::nothrow) Tracked(lDestroyed), QNPST_Individual, QNPAT_New));
-  lQueue.dequeue();
-  EXPECT_TRUE(lDestroyed);
-  EXPECT_TRUE(lQueue.isEmpty());
+  QNCQueue<QNSSticky> lQueue;
+  const auto lValue = std::make_shared<int>(1);
+  lQueue.enqueue(QNSSticky(lValue));
+  (void)lQueue.dequeue();
+  EXPECT_EQ(1, lValue.use_count()) << "the recycled node still holds the element";
 }
 
 // int is recycled through spare nodes (nothrow default construction and moves), QNCString is not:
