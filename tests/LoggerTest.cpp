@@ -9,6 +9,8 @@
 #include <thread>
 #include <vector>
 
+#include "DeathTestSupport.h"
+#include "LogSupport.h"
 #include "Logger.h"
 #include "QNString.h"
 #include "TestSupport.h"
@@ -22,35 +24,20 @@ std::vector<std::string> linesOf(const std::string& acrText) {
   return lLines;
 }
 
-size_t countOf(const std::string& acrText, const std::string& acrPart) {
-  size_t lCount = 0;
-  for (size_t lAt = acrText.find(acrPart); lAt != std::string::npos; lAt = acrText.find(acrPart, lAt + 1)) ++lCount;
-  return lCount;
-}
+using qntest::countOf;
 
 // Time stamp, tag, thread id, function, file and line, then the message (group 1).
-const std::regex kLine(R"(^\d{4}-\d\d-\d\d \d\d:\d\d:\d\d\.\d{6} -[HEWNIT]- \[\d+\] \S+ \([^ :]+:\d+\) (.*)$)");
+const std::regex kLine(
+    R"(^\d{4}-\d\d-\d\d \d\d:\d\d:\d\d\.\d{6} -[HEWNIT]- \[\d+\] \S+ \([^ :]+:\d+\) (.*)$)");
 
-// Each test writes to a log of its own in a fresh directory and closes it at the end, so the
-// logger is back in its closed state between tests.
-class LoggerTest : public ::testing::Test {
- protected:
-  void SetUp() override {
-    setLogCode(255);
-    CreateLogger(mLog.c_str());
-  }
-  void TearDown() override {
-    destroyLogger();
-    setLogCode(255);
-  }
-  std::string closeAndRead() {
-    destroyLogger();
-    return qntest::readFile(mLog);
-  }
+// The message of a line of the log's shape; the marker and the line itself when the shape is wrong.
+std::string messageOf(const std::string& acrLine) {
+  std::smatch lMatch;
+  return std::regex_match(acrLine, lMatch, kLine) ? lMatch[1].str() : "(malformed) " + acrLine;
+}
 
-  qntest::TempDir mDir;
-  std::string mLog = mDir.file("test.log");
-};
+// Each test writes to a log of its own in a fresh directory, closed again at the end.
+class LoggerTest : public qntest::LoggedTest {};
 
 TEST_F(LoggerTest, MaskSelectsTheLevelsWritten) {
   auto lLogEveryLevel = [](const char* apRound) {
@@ -66,51 +53,41 @@ TEST_F(LoggerTest, MaskSelectsTheLevelsWritten) {
   lLogEveryLevel("errors");
   // A direct call is filtered too, not only the macros.
   PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, __func__, __FILE__, "direct trace");
-  const std::string lLog = closeAndRead();
+  const std::string lLog = log();
   EXPECT_EQ(7u, linesOf(lLog).size()) << lLog;
-  for (const char* lpText : {"-H- ", "-E- ", "-W- ", "-N- ", "-I- ", "-T- "}) EXPECT_NE(0u, countOf(lLog, lpText));
-  for (const char* lpText : {"all halt", "all error", "all warning", "all notice", "all info", "all trace"})
-    EXPECT_EQ(1u, countOf(lLog, lpText)) << lpText;
-  EXPECT_EQ(1u, countOf(lLog, "errors error"));
-  EXPECT_EQ(0u, countOf(lLog, "direct trace"));
+  const std::pair<const char*, const char*> lTagged[] = {
+      {"all halt", "-H-"}, {"all error", "-E-"}, {"all warning", "-W-"}, {"all notice", "-N-"},
+      {"all info", "-I-"}, {"all trace", "-T-"}, {"errors error", "-E-"}};
+  for (const auto& lrTagged : lTagged)
+    EXPECT_EQ(lrTagged.second, qntest::levelOf(lLog, lrTagged.first)) << lLog;
 }
 
-TEST_F(LoggerTest, LineCarriesTimeTagThreadCallSiteAndMessage) {
+// A line carries time stamp, tag, thread, call site and message, and logging keeps errno. An
+// overlong message is cut to one line of the maximum length, on the "%s" fast path and the
+// formatted one alike; the line breaks of a message become blanks, trailing ones are dropped.
+TEST_F(LoggerTest, EveryMessageBecomesOneWellFormedBoundedLine) {
   const unsigned int lLine = __LINE__ + 1;
   QN_LOG_NOTICE("value %d of %s", 42, "forty-two");
   errno = EACCES;
   QN_ENTERED();
   EXPECT_EQ(EACCES, errno) << "logging changed errno";
-  const std::vector<std::string> lLines = linesOf(closeAndRead());
-  ASSERT_EQ(2u, lLines.size());
-  std::smatch lMatch;
-  ASSERT_TRUE(std::regex_match(lLines[0], lMatch, kLine)) << lLines[0];
-  EXPECT_EQ("value 42 of forty-two", lMatch[1].str());
-  const std::string lCallSite = std::string(" -N- [") + std::to_string(gettid()) + "] TestBody (tests/LoggerTest.cpp:" +
-                                std::to_string(lLine) + ") ";
-  EXPECT_NE(std::string::npos, lLines[0].find(lCallSite)) << lLines[0];
-  ASSERT_TRUE(std::regex_match(lLines[1], lMatch, kLine)) << lLines[1];
-  EXPECT_EQ("Entered", lMatch[1].str());
-}
-
-TEST_F(LoggerTest, OverlongOrMultiLineMessageStaysOneBoundedLine) {
   const std::string lLong(3 * kQNLogMaxLine, 'x');
   QN_LOG_INFO("%s", lLong.c_str());
-  QN_LOG_INFO("%s%s", lLong.c_str(), "tail");  // the formatted path, not only the "%s" fast path
+  QN_LOG_INFO("%s%s", lLong.c_str(), "tail");
   QN_LOG_INFO("first\nsecond\n\n");
-  QN_LOG_INFO("after");
-  const std::vector<std::string> lLines = linesOf(closeAndRead());
-  ASSERT_EQ(4u, lLines.size());
-  for (int lIndex = 0; lIndex < 2; ++lIndex) {
+  const std::vector<std::string> lLines = linesOf(log());
+  ASSERT_EQ(5u, lLines.size());
+  EXPECT_EQ("value 42 of forty-two", messageOf(lLines[0]));
+  const std::string lCallSite = std::string(" -N- [") + std::to_string(gettid()) +
+                                "] TestBody (tests/LoggerTest.cpp:" + std::to_string(lLine) + ") ";
+  EXPECT_NE(std::string::npos, lLines[0].find(lCallSite)) << lLines[0];
+  EXPECT_EQ("Entered", messageOf(lLines[1]));
+  for (int lIndex = 2; lIndex < 4; ++lIndex) {
     EXPECT_EQ(kQNLogMaxLine - 1, lLines[lIndex].size());
     EXPECT_NE(std::string::npos, lLines[lIndex].find(") xxxxxxxx"));
     EXPECT_EQ('x', lLines[lIndex].back());
   }
-  std::smatch lMatch;
-  ASSERT_TRUE(std::regex_match(lLines[2], lMatch, kLine)) << lLines[2];
-  EXPECT_EQ("first second", lMatch[1].str());
-  ASSERT_TRUE(std::regex_match(lLines[3], lMatch, kLine)) << lLines[3];
-  EXPECT_EQ("after", lMatch[1].str());
+  EXPECT_EQ("first second", messageOf(lLines[4]));
 }
 
 // Every thread writes numbered lines of its own letter, long enough to span many batches; a torn
@@ -132,14 +109,12 @@ TEST_F(LoggerTest, LinesOfConcurrentThreadsAreWholeAndNoneIsLost) {
     });
   }
   for (auto& lrThread : lThreads) lrThread.join();
-  const std::vector<std::string> lLines = linesOf(closeAndRead());
+  const std::vector<std::string> lLines = linesOf(log());
   ASSERT_EQ(static_cast<size_t>(kThreads * kLinesEach), lLines.size());
   std::vector<int> lNext(kThreads, 0);
   const std::regex lMessage(R"(t(\d) n(\d+) ([a-z]+))");
   for (const std::string& lrLine : lLines) {
-    std::smatch lMatch;
-    ASSERT_TRUE(std::regex_match(lrLine, lMatch, kLine)) << lrLine;
-    const std::string lText = lMatch[1].str();
+    const std::string lText = messageOf(lrLine);
     std::smatch lParts;
     ASSERT_TRUE(std::regex_match(lText, lParts, lMessage)) << lrLine;
     const int lThread = std::stoi(lParts[1].str());
@@ -149,28 +124,23 @@ TEST_F(LoggerTest, LinesOfConcurrentThreadsAreWholeAndNoneIsLost) {
   }
 }
 
-TEST_F(LoggerTest, UrgentLineIsInTheFileWhenTheCallReturns) {
+// Urgent lines, and whatever flushLogger() finds buffered, are in the file when the call returns.
+TEST_F(LoggerTest, UrgentOrFlushedLineIsInTheFileWhenTheCallReturns) {
   QN_LOG_TRACE("buffered before");
-  for (const char* lpTag : {"-H-", "-E-", "-W-"}) {
-    const std::string lText = std::string("urgent ") + lpTag;
-    PrintLogMessageWithTimeStamp(lpTag[1] == 'H' ? QNLL_Halt : lpTag[1] == 'E' ? QNLL_Error : QNLL_Warning, lpTag,
-                                 __LINE__, __func__, __FILE__, "%s", lText.c_str());
-    const std::string lLog = qntest::readFile(mLog);
+  const std::pair<QNELogLevel, const char*> lUrgent[] = {
+      {QNLL_Halt, "-H-"}, {QNLL_Error, "-E-"}, {QNLL_Warning, "-W-"}};
+  for (const auto& lrUrgent : lUrgent) {
+    const std::string lText = std::string("urgent ") + lrUrgent.second;
+    PrintLogMessageWithTimeStamp(lrUrgent.first, lrUrgent.second, __LINE__, __func__, __FILE__, "%s",
+                                 lText.c_str());
+    const std::string lLog = qntest::readFile(mLogPath);
     EXPECT_NE(std::string::npos, lLog.find(lText)) << lLog;
     // Order is kept: what was buffered before the urgent line is written with it.
     EXPECT_LT(lLog.find("buffered before"), lLog.find(lText));
   }
-}
-
-TEST_F(LoggerTest, OrdinaryLineReachesTheFileWithoutAnyFurtherCall) {
-  QN_LOG_INFO("left in the buffer");
-  EXPECT_TRUE(qntest::waitForText(mLog, "left in the buffer", std::chrono::seconds(3)));
-}
-
-TEST_F(LoggerTest, FlushLoggerWritesEverythingBuffered) {
   for (int lIndex = 0; lIndex < 10; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
   flushLogger();
-  EXPECT_EQ(10u, linesOf(qntest::readFile(mLog)).size());
+  EXPECT_EQ(14u, linesOf(qntest::readFile(mLogPath)).size());
 }
 
 TEST_F(LoggerTest, SecondCreateLoggerMovesTheLogAndAppendsToAnExistingFile) {
@@ -180,36 +150,21 @@ TEST_F(LoggerTest, SecondCreateLoggerMovesTheLogAndAppendsToAnExistingFile) {
   CreateLogger(lSecond.c_str());
   QN_LOG_TRACE("into the second");
   destroyLogger();
-  EXPECT_EQ(1u, countOf(qntest::readFile(mLog), "into the first"));
-  EXPECT_EQ(0u, countOf(qntest::readFile(mLog), "into the second"));
+  EXPECT_EQ(1u, countOf(qntest::readFile(mLogPath), "into the first"));
+  EXPECT_EQ(0u, countOf(qntest::readFile(mLogPath), "into the second"));
   const std::string lSecondText = qntest::readFile(lSecond);
   EXPECT_EQ(0u, lSecondText.find("existing line\n"));
   EXPECT_EQ(1u, countOf(lSecondText, "into the second"));
-}
-
-TEST_F(LoggerTest, AfterDestroyOnlyUrgentLinesReachStandardError) {
-  QN_LOG_TRACE("while open");
-  destroyLogger();
-  testing::internal::CaptureStderr();
-  QN_LOG_TRACE("closed trace");
-  QN_LOG_INFO("closed info");
-  QN_LOG_ERROR("closed error");
-  const std::string lStderr = testing::internal::GetCapturedStderr();
-  EXPECT_EQ(1u, countOf(lStderr, "closed error"));
-  EXPECT_EQ(0u, countOf(lStderr, "closed trace"));
-  EXPECT_EQ(0u, countOf(lStderr, "closed info"));
-  const std::string lLog = qntest::readFile(mLog);
-  EXPECT_EQ(1u, countOf(lLog, "while open"));
-  EXPECT_EQ(0u, countOf(lLog, "closed"));
 }
 
 // Regression: a child forked while lines sat in the buffer wrote them again at its exit, so the
 // parent's lines appeared twice in the log.
 TEST_F(LoggerTest, ChildForkedAfterCreateLoggerDoesNotRepeatTheParentsLines) {
   QN_LOG_TRACE("parent before fork");
-  // Once the flusher has written the line it idles; a fork while it was still starting up could
-  // copy a sanitizer's allocator lock held, and the child would hang in its exit-time leak check.
-  ASSERT_TRUE(qntest::waitForText(mLog, "parent before fork"));
+  // Once the flusher has written the line (with no further call) it idles; a fork while it was
+  // still starting up could copy a sanitizer's allocator lock held, and the child would hang in
+  // its exit-time leak check.
+  ASSERT_TRUE(qntest::waitForText(mLogPath, "parent before fork"));
   QN_LOG_TRACE("parent buffered at the fork");
   const pid_t lChild = fork();
   ASSERT_GE(lChild, 0);
@@ -220,7 +175,7 @@ TEST_F(LoggerTest, ChildForkedAfterCreateLoggerDoesNotRepeatTheParentsLines) {
   int lStatus = 0;
   ASSERT_EQ(lChild, waitpid(lChild, &lStatus, 0));
   EXPECT_TRUE(WIFEXITED(lStatus) && WEXITSTATUS(lStatus) == 0);
-  const std::string lLog = closeAndRead();
+  const std::string lLog = log();
   EXPECT_EQ(1u, countOf(lLog, "parent before fork")) << lLog;
   EXPECT_EQ(1u, countOf(lLog, "parent buffered at the fork")) << lLog;
   EXPECT_EQ(1u, countOf(lLog, "from the child")) << lLog;
@@ -242,13 +197,11 @@ class LoggerProcessTest : public ::testing::Test {
 
 TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
   ASSERT_EQ(0, run({"startup", mLog}));
-  const std::vector<std::string> lLines = linesOf(qntest::readFile(mLog));
-  ASSERT_EQ(4u, lLines.size());
-  EXPECT_NE(std::string::npos, lLines[0].find("-T- ")) << lLines[0];
-  EXPECT_NE(std::string::npos, lLines[0].find(") early trace 1"));
-  EXPECT_NE(std::string::npos, lLines[1].find(") early error 3"));
-  EXPECT_NE(std::string::npos, lLines[2].find(") early warning 4"));
-  EXPECT_NE(std::string::npos, lLines[3].find(") after open 5"));
+  const std::string lLog = qntest::readFile(mLog);
+  EXPECT_EQ(4u, linesOf(lLog).size()) << lLog;
+  EXPECT_EQ("-T-", qntest::levelOf(lLog, ") early trace 1"));
+  qntest::expectInOrder(
+      lLog, {") early trace 1\n", ") early error 3\n", ") early warning 4\n", ") after open 5\n"});
   // Urgent lines went to standard error at once, before and after the log; nothing else did.
   const std::string lStderr = stdErr();
   EXPECT_EQ(1u, countOf(lStderr, "early error 3"));

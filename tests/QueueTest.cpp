@@ -1,65 +1,63 @@
 #include <gtest/gtest.h>
 
-#include <new>
+#include <memory>
+#include <string>
 
-#include "Pointer.h"
 #include "QNException.h"
 #include "QNQueue.h"
 #include "QNString.h"
+#include "TestSupport.h"
 
 namespace {
 
-struct Tracked {
-  explicit Tracked(bool& arDestroyed) : mDestroyed(arDestroyed) {}
-  ~Tracked() { mDestroyed = true; }
-  bool& mDestroyed;
+// A recyclable element (nothrow default construction and moves) whose moves copy, so a moved-from
+// element still holds its reference: only a node emptied after the dequeue lets the reference go.
+// (A QNCPointer would not do: moving it out already empties the node.)
+struct QNSSticky {
+  QNSSticky() noexcept = default;
+  explicit QNSSticky(const std::shared_ptr<int>& acrValue) noexcept : mValue(acrValue) {}
+  QNSSticky(const QNSSticky&) = default;
+  QNSSticky(QNSSticky&& arOther) noexcept : mValue(arOther.mValue) {}
+  QNSSticky& operator=(const QNSSticky&) = default;
+  QNSSticky& operator=(QNSSticky&& arOther) noexcept {
+    mValue = arOther.mValue;
+    return *this;
+  }
+  std::shared_ptr<int> mValue;
 };
 
 // A recycled node must not keep the element it once held alive.
 TEST(QueueTest, DequeuedElementIsReleasedWithItsLastOutsideReference) {
-  QNCQueue<QNCPointer<Tracked>> lQueue;
-  bool lDestroyed = false;
-  lQueue.enqueue(QNCPointer<Tracked>(new (std::nothrow) Tracked(lDestroyed), QNPST_Individual, QNPAT_New));
-  lQueue.dequeue();
-  EXPECT_TRUE(lDestroyed);
+  QNCQueue<QNSSticky> lQueue;
+  const auto lValue = std::make_shared<int>(1);
+  lQueue.enqueue(QNSSticky(lValue));
+  (void)lQueue.dequeue();
+  EXPECT_EQ(1, lValue.use_count()) << "the recycled node still holds the element";
+}
+
+// int is recycled through spare nodes (nothrow default construction and moves), QNCString is not:
+// either way the order holds across recycled and fresh nodes, and a dequeue on an empty queue
+// is "Not Found" (8) and leaves the queue usable.
+template <class T, class Make>
+void expectFirstInFirstOut(const Make& acrMake) {
+  QNCQueue<T> lQueue;
+  const std::string kNotFound = "Not Found (code 8)";
+  EXPECT_EQ(kNotFound, qntest::thrown<QNCNotFoundEx>([&] { (void)lQueue.dequeue(); }, true));
+  for (int lValue = 1; lValue <= 3; ++lValue) lQueue.enqueue(acrMake(lValue));
+  EXPECT_EQ(acrMake(1), lQueue.dequeue());
+  EXPECT_EQ(acrMake(2), lQueue.dequeue());
+  for (int lValue = 4; lValue <= 6; ++lValue) lQueue.enqueue(acrMake(lValue));  // 6 needs a fresh node
+  EXPECT_EQ(4u, lQueue.numberOfElements());
+  for (int lValue = 3; lValue <= 6; ++lValue) EXPECT_EQ(acrMake(lValue), lQueue.dequeue());
+  EXPECT_EQ(kNotFound, qntest::thrown<QNCNotFoundEx>([&] { (void)lQueue.dequeue(); }, true));
+  lQueue.enqueue(acrMake(7));
+  EXPECT_EQ(acrMake(7), lQueue.dequeue());
   EXPECT_TRUE(lQueue.isEmpty());
 }
 
-TEST(QueueTest, OrderSurvivesNodeRecycling) {
-  QNCQueue<QNCPointer<int>> lQueue;
-  auto lMake = [](int aValue) { return QNCPointer<int>(new (std::nothrow) int(aValue), QNPST_Individual, QNPAT_New); };
-  lQueue.enqueue(lMake(1));
-  lQueue.enqueue(lMake(2));
-  lQueue.enqueue(lMake(3));
-  EXPECT_EQ(1, *lQueue.dequeue());
-  EXPECT_EQ(2, *lQueue.dequeue());
-  lQueue.enqueue(lMake(4));  // fills a recycled node
-  lQueue.enqueue(lMake(5));
-  lQueue.enqueue(lMake(6));  // needs a fresh one
-  EXPECT_EQ(4u, lQueue.numberOfElements());
-  EXPECT_EQ(3, *lQueue.dequeue());
-  EXPECT_EQ(4, *lQueue.dequeue());
-  EXPECT_EQ(5, *lQueue.dequeue());
-  EXPECT_EQ(6, *lQueue.dequeue());
-}
-
-TEST(QueueTest, DequeueOnEmptyThrowsAndLeavesTheQueueUsable) {
-  QNCQueue<QNCPointer<int>> lRecycling;
-  QNCQueue<QNCString> lPlain;  // a type whose default construction may throw: no recycling
-  for (int lRound = 0; lRound < 2; ++lRound) {
-    try {
-      lRecycling.dequeue();
-      FAIL() << "dequeue on an empty queue returned";
-    } catch (const QNCNotFoundEx& acrException) {
-      EXPECT_STREQ("Not Found", acrException.what());
-      EXPECT_EQ(8u, acrException.getCode());
-    }
-    EXPECT_THROW(lPlain.dequeue(), QNCNotFoundEx);
-    lRecycling.enqueue(QNCPointer<int>(new (std::nothrow) int(7), QNPST_Individual, QNPAT_New));
-    lPlain.enqueue(QNCString("seven"));
-    EXPECT_EQ(7, *lRecycling.dequeue());
-    EXPECT_EQ(QNCString("seven"), lPlain.dequeue());
-  }
+TEST(QueueTest, FirstInFirstOutAcrossRecycledNodesAndEmptyDequeues) {
+  expectFirstInFirstOut<int>([](int aValue) { return aValue; });
+  expectFirstInFirstOut<QNCString>([](int aValue) { return QNCString(std::to_string(aValue).c_str()); });
 }
 
 }  // namespace
