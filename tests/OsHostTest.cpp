@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 #include <net/if.h>
 #include <netinet/in.h>
-#include <signal.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -42,6 +41,7 @@ std::set<unsigned int> upNonLoopbackAddresses() {
   return lAddresses;
 }
 
+// A swapped byte order gives a number that is no address of this host, nor the loopback one.
 TEST(OsHostTest, IpAddressIsOneOfThisHostsInHostByteOrder) {
   unsigned int lAddress = 0;
   OsGetIpAddress(lAddress);
@@ -52,14 +52,6 @@ TEST(OsHostTest, IpAddressIsOneOfThisHostsInHostByteOrder) {
     EXPECT_EQ(1u, lCandidates.count(lAddress))
         << std::hex << lAddress << " is no non-loopback address of this host";
   }
-  // Binding succeeds only to an address of this host: a swapped byte order would fail here.
-  const int lSocket = socket(AF_INET, SOCK_DGRAM, 0);
-  ASSERT_GE(lSocket, 0);
-  sockaddr_in lBind = {};
-  lBind.sin_family = AF_INET;
-  lBind.sin_addr.s_addr = htonl(lAddress);
-  EXPECT_EQ(0, bind(lSocket, reinterpret_cast<sockaddr*>(&lBind), sizeof lBind)) << strerror(errno);
-  close(lSocket);
 }
 
 TEST(OsHostTest, OsNameIsLinuxWithTheRunningRelease) {
@@ -73,7 +65,8 @@ TEST(OsHostTest, OsNameIsLinuxWithTheRunningRelease) {
   EXPECT_EQ(0u, std::string(lVariant.get()).rfind("Linux " + lRelease + " ", 0)) << lVariant.get();
 }
 
-TEST(OsHostTest, KillReachesOneProcessAndRefusesGroups) {
+// That a real pid is signalled shows in the instance tests, which stop a running instance.
+TEST(OsHostTest, KillRefusesProcessGroups) {
   EXPECT_EQ(0, OsKill(getpid(), 0));
   // Signal 0 to 0 or -1 would succeed for a process group or everyone: refusal proves no call.
   for (int lPid : {0, -1}) {
@@ -81,14 +74,6 @@ TEST(OsHostTest, KillReachesOneProcessAndRefusesGroups) {
     EXPECT_GT(0, OsKill(lPid, 0)) << "pid " << lPid;
     EXPECT_EQ(EINVAL, errno);
   }
-  const pid_t lChild = fork();
-  if (lChild == 0) {
-    pause();
-    _exit(0);
-  }
-  ASSERT_EQ(0, OsKill(lChild, SIGTERM));
-  EXPECT_EQ(128 + SIGTERM, qntest::waitExit(lChild));
-  EXPECT_GT(0, OsKill(lChild, SIGTERM)) << "signalled a reaped child";
 }
 
 }  // namespace

@@ -1,10 +1,11 @@
 // driver_app: a service built on the start-up and shut-down driver, for the process-level tests.
 //
-//   driver_app run [<requests>]  runs until <requests> exit requests (default 1) have arrived
-//   driver_app config-missing    its parseConfigFile throws QNCNotImplementedEx
-//   driver_app throw <step>      the named lifecycle step throws QNCExistsEx
-//   driver_app unregistered      calls SystemMain without registering an object
-//   driver_app linger            stays alive for a second after SystemMain has returned
+//   driver_app run [<requests>]     runs until <requests> exit requests (default 1) have arrived;
+//                                   its parseConfigFile throws QNCNotImplementedEx, as a service
+//                                   without a configuration file does
+//   driver_app linger [<requests>]  as run, but parseConfigFile succeeds, and the process stays
+//                                   alive for a second after SystemMain has returned
+//   driver_app throw <step>         the named lifecycle step throws QNCExistsEx
 //
 // Every lifecycle operation is overridden and does not call the base operation, so what the
 // tests see is the driver's sequence alone. Each operation logs "step <name>" (the log goes to
@@ -38,14 +39,16 @@ void mark(const std::string& acrText) {
 class QNCDriverApp : public QNCSystem {
  public:
   QNCDriverApp(std::string aMode, std::string aFailingStep, unsigned int aExpectedRequests)
-      : mMode(std::move(aMode)), mFailingStep(std::move(aFailingStep)), mExpectedRequests(aExpectedRequests) {}
+      : mMode(std::move(aMode)),
+        mFailingStep(std::move(aFailingStep)),
+        mExpectedRequests(aExpectedRequests) {}
   ~QNCDriverApp() override { step("destructor"); }
 
   void preInit() override { step("preInit"); }
   void processCommandLine(int, char**) override { step("processCommandLine"); }
   void parseConfigFile(QNCString&) override {
     step("parseConfigFile");
-    if (mMode == "config-missing") throw QNCNotImplementedEx("no configuration file", 0);
+    if (mMode == "run") throw QNCNotImplementedEx("no configuration file", 0);
   }
   void applySettings() override { step("applySettings"); }
   void markAsRunning() override { step("markAsRunning"); }
@@ -104,9 +107,9 @@ class QNCDriverApp : public QNCSystem {
 int main(int argc, char** argv) {
   const std::string lMode = argc > 1 ? argv[1] : "run";
   const std::string lFailingStep = lMode == "throw" && argc > 2 ? argv[2] : "";
-  const unsigned int lRequests = lMode == "run" && argc > 2 ? static_cast<unsigned int>(atoi(argv[2])) : 1;
+  const unsigned int lRequests = lMode != "throw" && argc > 2 ? static_cast<unsigned int>(atoi(argv[2])) : 1;
   try {
-    if (lMode != "unregistered") setSystemObject(new QNCDriverApp(lMode, lFailingStep, lRequests));
+    setSystemObject(new QNCDriverApp(lMode, lFailingStep, lRequests));
     setLogFilePath("driver_app.log");
     SystemMain(argc, argv);
   } catch (const QNCException& acrException) {

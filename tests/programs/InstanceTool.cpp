@@ -5,8 +5,6 @@
 //   hold         mark this process as the running instance, print "running", wait for SIGTERM,
 //                release the instance and exit 0
 //   hold-stubborn  as hold, but SIGTERM is ignored: only SIGKILL ends it
-//   lock-only    take the lock without writing an id (an instance caught half-way), wait for
-//                SIGTERM
 //   kill         stop the running instance recorded in the file, exit 0 when that returns
 //
 //   --go <file>  wait until the file exists before acting (to start many tools at one moment)
@@ -90,11 +88,6 @@ int main(int argc, char** argv) {
       } else {
         for (;;) pause();
       }
-    } else if (lAction == "lock-only") {
-      lSystem.manager().openAndCheckLockStatus();
-      lSystem.manager().lock();
-      say("locked");
-      waitForSigTerm();
     } else if (lAction == "kill") {
       lSystem.killRunningInstance();
       say("kill returned");

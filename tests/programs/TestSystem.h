@@ -23,7 +23,4 @@ class QNCTestSystem : public QNCBareTestSystem {
     mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
         new (std::nothrow) QNCProcessInstanceManager(apPidFilePath), QNPST_Individual, QNPAT_New);
   }
-
-  // The manager itself, for the steps the system object does not wrap.
-  QNCProcessInstanceManager& manager() { return *mProcessInstanceManager; }
 };
