@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <set>
 #include <string>
 #include <thread>
 #include <vector>
@@ -102,8 +101,8 @@ TEST_F(SystemSettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
 }
 
 // With -c the file must supply the three keys; a missing one ends start-up after the earlier
-// ones were applied.
-TEST_F(SystemSettingsTest, ApplySettingsStopsAtTheFirstMissingKey) {
+// ones were applied. A value of the wrong kind is an exception, not a value.
+TEST_F(SystemSettingsTest, ApplySettingsStopsAtTheFirstMissingOrWrongKey) {
   setHbTimeout(30);
   mSystem.add("DebugLevel", new (std::nothrow) QNCMultiType(249u));
   mSystem.add("Daemonize", new (std::nothrow) QNCMultiType(static_cast<signed char>(1)));
@@ -114,23 +113,12 @@ TEST_F(SystemSettingsTest, ApplySettingsStopsAtTheFirstMissingKey) {
   getHbTimeout(lValue);
   EXPECT_EQ(30u, lValue);
   EXPECT_TRUE(mSystem.mDaemonizeCalls.empty());
-}
 
-TEST_F(SystemSettingsTest, SettingOfTheWrongKindIsAnExceptionNotAValue) {
-  mSystem.add("DebugLevel", new (std::nothrow) QNCMultiType("16"));
-  mSystem.add("HbTimeout", new (std::nothrow) QNCMultiType(30u));
-  mSystem.add("Daemonize", new (std::nothrow) QNCMultiType(1u));
-  EXPECT_THROW(mSystem.applySettings(), QNCInvalidEx);
-}
-
-TEST_F(SystemSettingsTest, InitCreatesTheIdentifierManagerStartingAtOne) {
-  mSystem.init();
-  unsigned int lId = 0;
-  mSystem.generateNumericId(lId);
-  EXPECT_EQ(1u, lId);
-  mSystem.returnNumericId(lId);
-  mSystem.generateNumericId(lId);
-  EXPECT_EQ(1u, lId);
+  SettingsTestSystem lWrongKind;
+  lWrongKind.add("DebugLevel", new (std::nothrow) QNCMultiType("16"));
+  lWrongKind.add("HbTimeout", new (std::nothrow) QNCMultiType(30u));
+  lWrongKind.add("Daemonize", new (std::nothrow) QNCMultiType(1u));
+  EXPECT_THROW(lWrongKind.applySettings(), QNCInvalidEx);
 }
 
 // Each thread marks the identifiers it holds in a shared table; a second holder of the same
@@ -172,11 +160,15 @@ TEST_F(SystemSettingsTest, ConcurrentThreadsNeverHoldTheSameIdentifier) {
   EXPECT_EQ(0u, lOutOfRange.load());
 }
 
-// If a refusal left mNidCreationLock held, the next call would block for ever (the test then
-// fails on its time-out).
-TEST_F(SystemSettingsTest, RefusalsThroughTheSystemLeaveTheLockFree) {
-  mSystem.useIdentifierBound(2);
+// init() creates the identifier manager, starting at 1. If a refusal left mNidCreationLock held,
+// the next call would block for ever (the test then fails on its time-out); a returned
+// identifier is handed out again.
+TEST_F(SystemSettingsTest, IdentifiersStartAtOneAndRefusalsLeaveTheLockFree) {
   unsigned int lId = 0;
+  mSystem.init();
+  mSystem.generateNumericId(lId);
+  EXPECT_EQ(1u, lId);
+  mSystem.useIdentifierBound(2);
   mSystem.generateNumericId(lId);
   mSystem.generateNumericId(lId);
   EXPECT_THROW(mSystem.generateNumericId(lId), QNCNotFoundEx);

@@ -5,9 +5,10 @@
 #include <future>
 #include <stdexcept>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "LogSupport.h"
-#include "Logger.h"
 #include "QNException.h"
 #include "TestSupport.h"
 #include "ThreadComponent.h"
@@ -46,7 +47,8 @@ std::atomic<bool> gsSleeperReturned{false};
 // No join of its own: the base destructor alone has to bring its thread down.
 class SleeperComponent : public QNCThreadComponent {
  public:
-  explicit SleeperComponent(std::promise<void>* apAsleep) : QNCThreadComponent("sleeper"), mpAsleep(apAsleep) {}
+  explicit SleeperComponent(std::promise<void>* apAsleep)
+      : QNCThreadComponent("sleeper"), mpAsleep(apAsleep) {}
 
  protected:
   void run() override {
@@ -60,46 +62,45 @@ class SleeperComponent : public QNCThreadComponent {
   std::promise<void>* mpAsleep;
 };
 
-TEST(ThreadComponentTest, RequestExitWakesABodyInALongWait) {
-  std::promise<void> lWaiting;
-  std::atomic<bool> lWoken{false};
-  ScriptedComponent lComponent("waiter", [&](ScriptedComponent& arSelf) {
-    lWaiting.set_value();
-    lWoken = arSelf.waitForExitRequest(kHour);
-  });
-  lComponent.init();
-  lWaiting.get_future().wait();
-  lComponent.requestExit();
-  lComponent.waitForExit();  // would block for an hour if the request did not wake the wait
-  EXPECT_TRUE(lWoken);
-  EXPECT_TRUE(lComponent.isExitRequested());
-}
-
-// Fault pinned: a request given before the body starts waiting must not be lost (a wait that
-// only listens for notifications would sleep the whole period).
-TEST(ThreadComponentTest, ARequestMadeBeforeTheWaitIsNotLost) {
-  std::promise<void> lGate;
-  std::shared_future<void> lGateOpen = lGate.get_future().share();
-  std::atomic<bool> lSeen{false};
-  ScriptedComponent lComponent("late", [&](ScriptedComponent& arSelf) {
-    lGateOpen.wait();
-    lSeen = arSelf.waitForExitRequest(kHour);
-  });
-  lComponent.init();
-  lComponent.requestExit();
-  lGate.set_value();
-  lComponent.waitForExit();
-  EXPECT_TRUE(lSeen);
+// Fault pinned for the request made first: a wait that only listens for notifications would
+// sleep the whole period instead of seeing the request already given.
+TEST(ThreadComponentTest, RequestExitWakesABodyInALongWaitEvenWhenMadeBeforeIt) {
+  for (const bool lRequestFirst : {false, true}) {
+    std::promise<void> lStarted;
+    std::promise<void> lGate;
+    std::shared_future<void> lGateOpen = lGate.get_future().share();
+    std::atomic<bool> lWoken{false};
+    ScriptedComponent lComponent("waiter", [&](ScriptedComponent& arSelf) {
+      lStarted.set_value();
+      if (lRequestFirst) lGateOpen.wait();
+      lWoken = arSelf.waitForExitRequest(kHour);
+    });
+    lComponent.init();
+    lStarted.get_future().wait();
+    lComponent.requestExit();
+    lGate.set_value();
+    lComponent.waitForExit();  // would block for an hour if the request did not end the wait
+    EXPECT_TRUE(lWoken) << (lRequestFirst ? "request before the wait" : "request during the wait");
+    EXPECT_TRUE(lComponent.isExitRequested());
+  }
 }
 
 // A request before init() is refused and not remembered; a wait without a request reports none;
-// init() runs once; joins and requests after the end are no-ops.
+// init() runs once; joins and requests after the end are no-ops. Fault pinned: the owner joins
+// (holding the join lock) while the body waits for its own exit; the body blocked on that lock
+// and the join never finished.
 TEST(ThreadComponentTest, LifecycleStatesAndRepeatedCalls) {
   std::atomic<int> lRequestedAtStart{-1};
   std::atomic<int> lWaitResult{-1};
+  std::atomic<bool> lSelfWaitRefused{false};
   ScriptedComponent lComponent("once", [&](ScriptedComponent& arSelf) {
     lRequestedAtStart = arSelf.isExitRequested() ? 1 : 0;
     lWaitResult = arSelf.waitForExitRequest(1) ? 1 : 0;
+    try {
+      arSelf.waitForExit();
+    } catch (const QNCInvalidEx&) {
+      lSelfWaitRefused = true;
+    }
   });
   EXPECT_EQ("Thread 'once' was never started",
             qntest::thrown<QNCInvalidEx>([&] { lComponent.requestExit(); }));
@@ -111,50 +112,32 @@ TEST(ThreadComponentTest, LifecycleStatesAndRepeatedCalls) {
   lComponent.waitForExit();
   EXPECT_EQ(0, lRequestedAtStart);
   EXPECT_EQ(0, lWaitResult);
+  EXPECT_TRUE(lSelfWaitRefused);
   EXPECT_FALSE(lComponent.isExitRequested());
   lComponent.waitForExit();            // already joined: returns at once
   EXPECT_TRUE(lComponent.isInited());  // started once, stays so after the end
-  lComponent.requestExit();  // the thread has ended: no effect, no failure
-  EXPECT_STREQ("once", lComponent.getName().get());
+  lComponent.requestExit();            // the thread has ended: no effect, no failure
 }
 
-// Fault pinned: the owner joins (holding the join lock) while the body waits for its own exit;
-// the body blocked on that lock and the join never finished.
-TEST(ThreadComponentTest, WaitingForItsOwnExitIsRefused) {
-  std::atomic<bool> lRefused{false};
-  ScriptedComponent lComponent("self", [&](ScriptedComponent& arSelf) {
-    try {
-      arSelf.waitForExit();
-    } catch (const QNCInvalidEx&) {
-      lRefused = true;
-    }
-  });
-  lComponent.init();
-  lComponent.waitForExit();
-  EXPECT_TRUE(lRefused);
-}
-
-// An exception leaving a thread function would call std::terminate; here each one is logged
-// with its message and the test process lives on to read the log.
+// An exception leaving a thread function would call std::terminate; here each kind is logged at
+// error level with its message and the test process lives on to read the log.
 class ThreadComponentLogTest : public qntest::LoggedTest {};
 
 TEST_F(ThreadComponentLogTest, AnExceptionFromTheBodyIsLoggedAndTheProcessGoesOn) {
-  {
-    ScriptedComponent lFamily("family", [](ScriptedComponent&) { throw QNCInvalidEx("sensor lost", 6); });
-    ScriptedComponent lStandard("standard", [](ScriptedComponent&) { throw std::runtime_error("bus error"); });
-    ScriptedComponent lOther("other", [](ScriptedComponent&) { throw 42; });
-    lFamily.init();
-    lStandard.init();
-    lOther.init();
-    lFamily.waitForExit();
-    lStandard.waitForExit();
-    lOther.waitForExit();
+  const std::vector<std::pair<ScriptedComponent::Body, std::string>> lCases = {
+      {[](ScriptedComponent&) { throw QNCInvalidEx("sensor lost", 6); }, "sensor lost"},
+      {[](ScriptedComponent&) { throw std::runtime_error("bus error"); }, "bus error"},
+      {[](ScriptedComponent&) { throw 42; }, "unknown exception"},
+  };
+  for (const auto& lrCase : lCases) {
+    ScriptedComponent lComponent("thrower", lrCase.first);
+    lComponent.init();
+    lComponent.waitForExit();
   }
   const std::string lText = log();
-  EXPECT_NE(std::string::npos, lText.find("-E-")) << lText;
-  EXPECT_NE(std::string::npos, lText.find("Thread 'family' ended by an exception: sensor lost")) << lText;
-  EXPECT_NE(std::string::npos, lText.find("Thread 'standard' ended by an exception: bus error")) << lText;
-  EXPECT_NE(std::string::npos, lText.find("Thread 'other' ended by an exception: unknown exception")) << lText;
+  for (const auto& lrCase : lCases)
+    EXPECT_EQ("-E-", qntest::levelOf(lText, "Thread 'thrower' ended by an exception: " + lrCase.second))
+        << lText;
 }
 
 // Destroying a started, never-joined component must not reach std::terminate (a joinable
