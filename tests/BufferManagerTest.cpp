@@ -23,11 +23,15 @@
 
 namespace {
 
-// A system object that only supplies the bucket list.
+// A system object that only supplies the bucket list (and, on request, its manager).
 class BucketSystem : public QNCSystem {
  public:
   explicit BucketSystem(const std::vector<unsigned int>& acrLengths) {
     for (const unsigned int lLength : acrLengths) mMemoryBufferList.pushBack(lLength);
+  }
+  void installManager() {
+    mBufferManager = QNCPointer<QNCBufferManager>(new (std::nothrow) QNCBufferManager(this), QNPST_Individual,
+                                                  QNPAT_New);
   }
   void setCommandLineArgumentDesc() override {}
   void parseConfigFile(QNCString&) override { throw QNCNotImplementedEx("no configuration file", 0); }
@@ -213,6 +217,25 @@ TEST_F(BufferManagerTest, DestructionReportsTheUsedLengthsOfIdleBuffers) {
   EXPECT_EQ(1u, linesWith("TOTAL Memory Used : 30").size());
   // The pool dropped its references; the caller's survive.
   EXPECT_EQ(10u, lA->getLength());
+}
+
+// The system object's buffer services reach its manager: clearBuffer returns a buffer to the pool
+// as reuseBuffer does, re-bucketed by its used length.
+TEST_F(BufferManagerTest, SystemServicesReachTheManager) {
+  BucketSystem lSystem({64, 256});
+  lSystem.installManager();
+  QNCPointer<QNCBuffer> lBuffer;
+  lSystem.getBuffer(100, lBuffer);
+  QNCBuffer* const lObject = lBuffer.get();
+  lSystem.reuseBuffer(lBuffer);
+  QNCPointer<QNCBuffer> lAgain;
+  lSystem.getBuffer(150, lAgain);
+  EXPECT_EQ(lObject, lAgain.get());
+  lSystem.clearBuffer(lAgain);
+  lSystem.getBuffer(30, lAgain);
+  EXPECT_NE(lObject, lAgain.get());  // 150 went back to the 256 bucket
+  lSystem.getBuffer(256, lAgain);
+  EXPECT_EQ(lObject, lAgain.get());
 }
 
 // Threads take and return buffers of every bucket, also lowering the used length so buffers
