@@ -75,7 +75,10 @@ TEST(DriverTest, SecondRegistrationReplacesTheFirstWithoutDeletingIt) {
   EXPECT_EXIT(
       {
         static int sDestroyed = 0;
-        setSystemObject(new QNCRegisteredSystem(&sDestroyed));
+        // Kept reachable: the replaced object is deliberately not deleted, and the leak checker
+        // must not count it at exit.
+        static QNCRegisteredSystem* spFirst = new QNCRegisteredSystem(&sDestroyed);
+        setSystemObject(spFirst);
         auto* lpSecond = new QNCRegisteredSystem(&sDestroyed);
         setSystemObject(lpSecond);
         QNCSystem* lpSeen = nullptr;
