@@ -75,6 +75,11 @@ void QNCProcessInstanceManager::markAsRunning() {
   reopenPidFile();
   QN_LOG_TRACE("Locking the PID file again");
   lock();
+  // The lock was free while the file was reopened: a start that slipped into that gap may have
+  // written its own id before it lost the lock to us. Only the holder writes from here on, so
+  // writing ours again leaves the file naming the instance that keeps the lock.
+  QN_LOG_TRACE("Writing running pid %d again under the kept lock", lPid);
+  ClibWrite(mPidFileFd, &lPid, kPidBytes);
   QN_LEFT();
 }
 

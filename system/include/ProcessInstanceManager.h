@@ -54,7 +54,9 @@ class QNCProcessInstanceManager {
   // exactly one ends up running and the others fail with one of these two exceptions.
   // Also QNCOpenFailedEx, QNCWriteFailedEx, QNCCloseFailedEx from the file operations.
   // The file then holds the id of the instance that goes on running, also when many first starts
-  // race to create it: creating never truncates (see openPidFile).
+  // race to create it (creating never truncates, see openPidFile) and when a start that slipped
+  // into the reopening gap wrote its id before losing the lock: the id is written again once the
+  // final lock is held.
   virtual void markAsRunning();
 
   // Stops the instance recorded in the file: SIGTERM, then up to 10 attempts one second apart to
