@@ -4,10 +4,12 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
 #include <vector>
 
 #include "Logger.h"
 #include "TableSystem.h"
+#include "TestSupport.h"
 
 namespace {
 
@@ -44,16 +46,10 @@ TEST_F(SystemListsTest, EnlistFrontAndDelistBackWorkAtTheOtherEnd) {
 // Each removal on an empty list must release the list's lock on its way out: the enlist that
 // follows would otherwise block for ever.
 TEST_F(SystemListsTest, RemovingFromEmptyListThrowsNotFoundAndLeavesItUsable) {
-  for (int lRound = 0; lRound < 3; ++lRound) {
-    try {
-      if (lRound == 0) mSystem.delist(0);
-      if (lRound == 1) mSystem.delistBack(0);
-      if (lRound == 2) mSystem.listFront(0);
-      ADD_FAILURE() << "no exception in round " << lRound;
-    } catch (const QNCNotFoundEx& acrException) {
-      EXPECT_STREQ("Not Found", acrException.what());
-      EXPECT_EQ(8u, acrException.getCode());
-    }
+  const std::vector<std::function<void()>> lRemovals = {
+      [&] { mSystem.delist(0); }, [&] { mSystem.delistBack(0); }, [&] { mSystem.listFront(0); }};
+  for (int lRound = 0; lRound < static_cast<int>(lRemovals.size()); ++lRound) {
+    EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lRemovals[lRound], true)) << lRound;
     ASSERT_TRUE(
         qntest::returnsWithin([&] { mSystem.enlist(0, makeItem(lRound)); }, std::chrono::seconds(10)));
     EXPECT_EQ(lRound, idOf(mSystem.delist(0)));

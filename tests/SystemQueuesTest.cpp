@@ -3,8 +3,11 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
+#include <vector>
 
 #include "TableSystem.h"
+#include "TestSupport.h"
 
 namespace {
 
@@ -30,15 +33,10 @@ TEST_F(SystemQueuesTest, ElementsLeaveTheirOwnQueueInTheOrderTheyCame) {
 }
 
 TEST_F(SystemQueuesTest, TakingFromAnEmptyQueueThrowsNotFoundAndLeavesItUsable) {
-  for (int lRound = 0; lRound < 2; ++lRound) {
-    try {
-      if (lRound == 0) mSystem.dequeue(0);
-      if (lRound == 1) mSystem.queueFront(0);
-      ADD_FAILURE() << "no exception in round " << lRound;
-    } catch (const QNCNotFoundEx& acrException) {
-      EXPECT_STREQ("Not Found", acrException.what());
-      EXPECT_EQ(8u, acrException.getCode());
-    }
+  const std::vector<std::function<void()>> lTakes = {[&] { mSystem.dequeue(0); },
+                                                     [&] { mSystem.queueFront(0); }};
+  for (int lRound = 0; lRound < static_cast<int>(lTakes.size()); ++lRound) {
+    EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lTakes[lRound], true)) << lRound;
     ASSERT_TRUE(
         qntest::returnsWithin([&] { mSystem.enqueue(0, makeItem(lRound)); }, std::chrono::seconds(10)));
     EXPECT_EQ(lRound, idOf(mSystem.dequeue(0)));
