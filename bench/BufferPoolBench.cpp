@@ -5,7 +5,10 @@
 // masked off (trace:0) and with the default mask (trace:1); the log goes to /dev/null so the
 // trace figures include formatting and the logger's write path but never fill a disk.
 //
-//   SameThread      get + reuse of one size from one thread.
+//   SameThread      get + reuse of one size from one thread. Beside the baseline, SameLocks:
+//                   the work the pool's rules ask of every get + reuse (a first-fit scan, one
+//                   std::mutex per call, a FIFO that holds its own counted reference and never
+//                   allocates), built from the standard library: the floor for this design.
 //   CrossThread     buffers taken on one thread and returned (or dropped) on another, as the
 //                   service's threads do; handed over in batches of 512, so that few handovers
 //                   happen and thread scheduling does not dominate the figure.
@@ -14,6 +17,8 @@
 #include <benchmark/benchmark.h>
 
 #include <atomic>
+#include <memory>
+#include <mutex>
 #include <new>
 #include <thread>
 #include <vector>
@@ -79,6 +84,75 @@ void BM_SameThread_Unpooled(benchmark::State& arState) {
   for (auto _ : arState) {
     QNCPointer<QNCBuffer> lBuffer = allocate(lLength);
     benchmark::DoNotOptimize(static_cast<unsigned char*>(*lBuffer));
+  }
+  arState.SetItemsProcessed(arState.iterations());
+}
+
+// The pool's rules with nothing else: first fit over the same lengths, one lock per call, FIFO
+// buckets of shared references in rings that never allocate (a full ring drops the buffer).
+class SameLocksPool {
+ public:
+  SameLocksPool() {
+    for (Bucket& lBucket : mBuckets) lBucket.mRing.resize(kRingSize);
+  }
+
+  std::shared_ptr<QNCBuffer> get(unsigned int aLength) {
+    const unsigned int lIndex = _bucket(aLength);
+    Bucket& lBucket = mBuckets[lIndex];
+    std::shared_ptr<QNCBuffer> lBuffer;
+    {
+      std::lock_guard<std::mutex> lGuard(lBucket.mMutex);
+      if (lBucket.mCount == 0) {
+        lBuffer = std::make_shared<QNCAllocatedBuffer>(aLength, kLengths[lIndex]);
+      } else {
+        lBuffer = std::move(lBucket.mRing[lBucket.mHead]);
+        lBucket.mHead = (lBucket.mHead + 1) % kRingSize;
+        --lBucket.mCount;
+        lBuffer->setLength(aLength);
+      }
+    }
+    return lBuffer;
+  }
+
+  void reuse(const std::shared_ptr<QNCBuffer>& acrBuffer) {
+    Bucket& lBucket = mBuckets[_bucket(acrBuffer->getLength())];
+    std::shared_ptr<QNCBuffer> lQueued(acrBuffer);
+    std::lock_guard<std::mutex> lGuard(lBucket.mMutex);
+    if (lBucket.mCount == kRingSize) return;
+    lBucket.mRing[(lBucket.mHead + lBucket.mCount) % kRingSize] = std::move(lQueued);
+    ++lBucket.mCount;
+  }
+
+ private:
+  static constexpr unsigned int kLengths[] = {64, 256, 1024, 4096};
+  static constexpr size_t kRingSize = 16;
+
+  struct Bucket {
+    std::mutex mMutex;  // guards mRing, mHead and mCount
+    std::vector<std::shared_ptr<QNCBuffer>> mRing;
+    size_t mHead = 0;
+    size_t mCount = 0;
+  };
+
+  static unsigned int _bucket(unsigned int aLength) {
+    unsigned int lIndex = 0;
+    while (kLengths[lIndex] < aLength) ++lIndex;  // the benchmark never asks beyond the last
+    return lIndex;
+  }
+
+  Bucket mBuckets[4];
+};
+
+void BM_SameThread_SameLocks(benchmark::State& arState) {
+  const unsigned int lLength = static_cast<unsigned int>(arState.range(0));
+  prepareLogging(arState.range(1) != 0);
+  SameLocksPool lPool;
+  std::shared_ptr<QNCBuffer> lBuffer = lPool.get(lLength);
+  lPool.reuse(lBuffer);
+  for (auto _ : arState) {
+    lBuffer = lPool.get(lLength);
+    benchmark::DoNotOptimize(static_cast<unsigned char*>(*lBuffer));
+    lPool.reuse(lBuffer);
   }
   arState.SetItemsProcessed(arState.iterations());
 }
@@ -234,6 +308,7 @@ void buckets(benchmark::internal::Benchmark* apBenchmark) {
 
 BENCHMARK(BM_SameThread_Unpooled)->Apply(sizes);
 BENCHMARK(BM_SameThread_Pooled)->Apply(sizes);
+BENCHMARK(BM_SameThread_SameLocks)->ArgNames({"bytes", "trace"})->Args({256, 0})->Args({4096, 0});
 BENCHMARK(BM_CrossThread_Unpooled)->Apply(crossSizes);
 BENCHMARK(BM_CrossThread_Pooled)->Apply(crossSizes);
 BENCHMARK(BM_TwoThreads_Unpooled)->Apply(buckets);

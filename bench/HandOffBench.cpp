@@ -2,10 +2,16 @@
 // conditionals (enlist + signal / waitOnEmptyList + delist), against a baseline of a plain
 // std::mutex + std::deque + std::condition_variable queue of std::shared_ptr.
 //
-// Each benchmark measures both contenders in the same run, round by round: every iteration
-// hands one batch through the baseline and one through the system object (the order alternates
-// between rounds). The counters give each contender's rate over all rounds and their ratio
-// (system / baseline); the benchmark's own time is the system object's.
+// A third contender takes the same locks as the system object's calls, built from the standard
+// library alone (a list with its own mutex, a separate conditional, the emptiness test under
+// both, a separate delist): the floor for this sequence of calls. Its ratio to the system object
+// (same_locks_ratio) is the cost of the library's own code; the ratio to the baseline is the
+// cost of the call sequence.
+//
+// Each benchmark measures the contenders in the same run, round by round: every iteration
+// hands one batch through each (the order rotates between rounds). The counters give each
+// contender's rate over all rounds and the ratios (system / baseline, system / same locks);
+// the benchmark's own time is the system object's.
 //
 //   Stream/P:C   P producers hand kStreamBatch items in total to C consumers; items per second.
 //   PingPong     one object goes back and forth between two threads; round trips per second.
@@ -21,6 +27,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <deque>
+#include <list>
 #include <memory>
 #include <mutex>
 #include <new>
@@ -66,6 +73,46 @@ class BaselineQueue {
   std::mutex mMutex;  // guards mItems
   std::condition_variable mNotEmpty;
   std::deque<std::shared_ptr<Item>> mItems;
+};
+
+// --- The system object's sequence of locks, with the standard library: enlist under the list's
+// mutex, then signal under the conditional's; wait under the conditional's mutex with the
+// emptiness test under the list's, then delist under the list's mutex again.
+class SameLocksQueue {
+ public:
+  void push(const std::shared_ptr<Item>& acrItem) {
+    {
+      std::lock_guard<std::mutex> lGuard(mListMutex);
+      mItems.push_back(acrItem);
+    }
+    std::lock_guard<std::mutex> lGuard(mConditionMutex);
+    mNotEmpty.notify_one();
+  }
+
+  std::shared_ptr<Item> pop() {
+    for (;;) {
+      {
+        std::unique_lock<std::mutex> lGuard(mConditionMutex);
+        while (_isEmpty()) mNotEmpty.wait(lGuard);
+      }
+      std::lock_guard<std::mutex> lGuard(mListMutex);
+      if (mItems.empty()) continue;  // another consumer was first
+      std::shared_ptr<Item> lItem = mItems.front();
+      mItems.pop_front();
+      return lItem;
+    }
+  }
+
+ private:
+  bool _isEmpty() {
+    std::lock_guard<std::mutex> lGuard(mListMutex);
+    return mItems.empty();
+  }
+
+  std::mutex mConditionMutex;
+  std::condition_variable mNotEmpty;
+  std::mutex mListMutex;  // guards mItems
+  std::list<std::shared_ptr<Item>> mItems;
 };
 
 // --- The system object with the tables the hand-offs use: lists 0 and 1, each paired with the
@@ -123,9 +170,10 @@ double runThreads(int aThreads, Body aBody) {
 
 // Producers 0..P-1 hand their share and then one stop marker; consumers end at their first
 // marker, so every item is taken before the last consumer ends.
-double streamBaseline(int aProducers, int aConsumers, const std::vector<std::shared_ptr<Item>>& acrItems,
+template <class Queue>
+double streamStandard(int aProducers, int aConsumers, const std::vector<std::shared_ptr<Item>>& acrItems,
                       const std::shared_ptr<Item>& acrStop) {
-  BaselineQueue lQueue;
+  Queue lQueue;
   const int lShare = kStreamBatch / aProducers;
   return runThreads(aProducers + aConsumers, [&](int aIndex) {
     if (aIndex < aProducers) {
@@ -158,6 +206,11 @@ void reportRates(benchmark::State& arState, double aBaselineSeconds, double aSys
   arState.counters["ratio"] = aBaselineSeconds / aSystemSeconds;
 }
 
+void reportSameLocks(benchmark::State& arState, double aSameLocksSeconds, double aSystemSeconds, double aCount) {
+  arState.counters["same_locks_per_s"] = aCount / aSameLocksSeconds;
+  arState.counters["same_locks_ratio"] = aSameLocksSeconds / aSystemSeconds;
+}
+
 void BM_Stream(benchmark::State& arState) {
   qnbench::setTraceLogging(false);
   const int lProducers = static_cast<int>(arState.range(0));
@@ -171,20 +224,27 @@ void BM_Stream(benchmark::State& arState) {
   const auto lBaselineStop = std::make_shared<Item>();
   const QNCPointer<QNCQueueable> lSystemStop(new (std::nothrow) Item);
   HandOffSystem lSystem;
-  double lBaselineSeconds = 0;
-  double lSystemSeconds = 0;
-  bool lBaselineFirst = true;
+  double lSeconds[3] = {0, 0, 0};  // baseline, same locks, system object
+  int lFirst = 0;
   for (auto _ : arState) {
     double lRound = 0;
-    if (lBaselineFirst) lBaselineSeconds += streamBaseline(lProducers, lConsumers, lBaselineItems, lBaselineStop);
-    lRound = streamSystem(lSystem, lProducers, lConsumers, lSystemItems, lSystemStop);
-    if (!lBaselineFirst) lBaselineSeconds += streamBaseline(lProducers, lConsumers, lBaselineItems, lBaselineStop);
-    lSystemSeconds += lRound;
+    for (int lTurn = 0; lTurn < 3; ++lTurn) {
+      const int lContender = (lFirst + lTurn) % 3;
+      if (lContender == 0) {
+        lSeconds[0] += streamStandard<BaselineQueue>(lProducers, lConsumers, lBaselineItems, lBaselineStop);
+      } else if (lContender == 1) {
+        lSeconds[1] += streamStandard<SameLocksQueue>(lProducers, lConsumers, lBaselineItems, lBaselineStop);
+      } else {
+        lRound = streamSystem(lSystem, lProducers, lConsumers, lSystemItems, lSystemStop);
+        lSeconds[2] += lRound;
+      }
+    }
     arState.SetIterationTime(lRound);
-    lBaselineFirst = !lBaselineFirst;
+    lFirst = (lFirst + 1) % 3;
   }
   const double lItems = static_cast<double>(arState.iterations()) * kStreamBatch;
-  reportRates(arState, lBaselineSeconds, lSystemSeconds, lItems);
+  reportRates(arState, lSeconds[0], lSeconds[2], lItems);
+  reportSameLocks(arState, lSeconds[1], lSeconds[2], lItems);
   qnbench::setTraceLogging(true);
 }
 BENCHMARK(BM_Stream)->ArgNames({"producers", "consumers"})->Args({1, 1})->Args({2, 2})->UseManualTime()->Iterations(40);
@@ -243,6 +303,7 @@ void BM_OneThread(benchmark::State& arState) {
   constexpr int kBatch = 10000;
   HandOffSystem lSystem;
   BaselineQueue lBaseline;
+  SameLocksQueue lSameLocks;
   const QNCPointer<QNCQueueable> lSystemItem(new (std::nothrow) Item);
   const auto lBaselineItem = std::make_shared<Item>();
   auto lTime = [](auto aBody) {
@@ -251,11 +312,16 @@ void BM_OneThread(benchmark::State& arState) {
     return std::chrono::duration<double>(Clock::now() - lStart).count();
   };
   double lBaselineSeconds = 0;
+  double lSameLocksSeconds = 0;
   double lSystemSeconds = 0;
   for (auto _ : arState) {
     lBaselineSeconds += lTime([&] {
       lBaseline.push(lBaselineItem);
       benchmark::DoNotOptimize(lBaseline.pop());
+    });
+    lSameLocksSeconds += lTime([&] {
+      lSameLocks.push(lBaselineItem);
+      benchmark::DoNotOptimize(lSameLocks.pop());
     });
     const double lRound = lTime([&] {
       lSystem.handOff(0, lSystemItem);
@@ -264,7 +330,9 @@ void BM_OneThread(benchmark::State& arState) {
     lSystemSeconds += lRound;
     arState.SetIterationTime(lRound);
   }
-  reportRates(arState, lBaselineSeconds, lSystemSeconds, static_cast<double>(arState.iterations()) * kBatch);
+  const double lItems = static_cast<double>(arState.iterations()) * kBatch;
+  reportRates(arState, lBaselineSeconds, lSystemSeconds, lItems);
+  reportSameLocks(arState, lSameLocksSeconds, lSystemSeconds, lItems);
   qnbench::setTraceLogging(true);
 }
 BENCHMARK(BM_OneThread)->UseManualTime()->Iterations(200);

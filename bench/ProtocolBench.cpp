@@ -1,15 +1,23 @@
 // Framed messages through the descriptor channel ends against raw read/write of the same bytes,
 // and the round-trip rate over TCP loopback against a socket pair.
 //
+// Beside each, the same traffic made raw with the system calls a framed message needs (a prefix
+// write, a body write, the reader's staged reads): what the operating system charges for the
+// message's shape, so that framed / split-raw is the cost of the library's own code.
+//
 // Run with --benchmark_enable_random_interleaving=true --benchmark_repetitions=N so the
 // contenders alternate through the run (scripts/bench.sh does).
 
 #include <arpa/inet.h>
 #include <benchmark/benchmark.h>
+#include <fcntl.h>
 #include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <cstring>
 #include <thread>
 #include <vector>
 
@@ -77,6 +85,56 @@ void BM_RawSocketPair(benchmark::State& arState) {
   close(lPair[1]);
 }
 
+void writeAll(int aFd, const void* apBytes, size_t aCount) {
+  size_t lDone = 0;
+  while (lDone < aCount) {
+    const ssize_t lWritten = write(aFd, static_cast<const unsigned char*>(apBytes) + lDone, aCount - lDone);
+    if (lWritten > 0) lDone += static_cast<size_t>(lWritten);
+  }
+}
+
+// Reads exactly aCount bytes from a non-blocking descriptor, waiting with poll as the framed
+// reader does; false at end of stream.
+bool pollReadAll(int aFd, unsigned char* apBytes, size_t aCount) {
+  size_t lDone = 0;
+  while (lDone < aCount) {
+    const ssize_t lRead = read(aFd, apBytes + lDone, aCount - lDone);
+    if (lRead == 0) return false;
+    if (lRead > 0) {
+      lDone += static_cast<size_t>(lRead);
+      continue;
+    }
+    struct pollfd lPoll = {aFd, POLLIN, 0};
+    poll(&lPoll, 1, 100);
+  }
+  return true;
+}
+
+// The framed message's system calls without the library: a 4-byte write, a body write, one read
+// of up to the reader's staging size, then the rest of a large body straight into place.
+void BM_RawSplitSocketPair(benchmark::State& arState) {
+  const size_t lSize = static_cast<size_t>(arState.range(0));
+  int lPair[2];
+  socketpair(AF_UNIX, SOCK_STREAM, 0, lPair);
+  enlargeBuffers(lPair[0]);
+  enlargeBuffers(lPair[1]);
+  std::vector<unsigned char> lOut(lSize, 7), lIn(lSize), lStaging(QNCFdReader::kDefaultStagingSize);
+  const unsigned int lPrefix = static_cast<unsigned int>(lSize);
+  for (auto _ : arState) {
+    writeAll(lPair[0], &lPrefix, sizeof lPrefix);
+    writeAll(lPair[0], lOut.data(), lSize);
+    const size_t lStaged = static_cast<size_t>(read(lPair[1], lStaging.data(), lStaging.size()));
+    size_t lDone = lStaged - sizeof lPrefix;
+    memcpy(lIn.data(), lStaging.data() + sizeof lPrefix, lDone);
+    while (lDone < lSize) lDone += static_cast<size_t>(read(lPair[1], lIn.data() + lDone, lSize - lDone));
+    benchmark::DoNotOptimize(lIn.data());
+  }
+  arState.SetItemsProcessed(arState.iterations());
+  arState.SetBytesProcessed(arState.iterations() * static_cast<int64_t>(lSize));
+  close(lPair[0]);
+  close(lPair[1]);
+}
+
 void tcpPair(int aFds[2]) {
   const int lListener = socket(AF_INET, SOCK_STREAM, 0);
   sockaddr_in lAddress = {};
@@ -129,6 +187,36 @@ void roundTrips(benchmark::State& arState, int aFds[2]) {
   qnbench::setTraceLogging(true);
 }
 
+// The same round trips made raw: prefix and body written separately (Nagle off on TCP, as the
+// framed writer sets it), read back with non-blocking reads and poll.
+void rawRoundTrips(benchmark::State& arState, int aFds[2]) {
+  const int lOne = 1;
+  for (int lIndex = 0; lIndex < 2; ++lIndex) {
+    // Fails harmlessly on a socket pair, which has no Nagle's algorithm to turn off.
+    setsockopt(aFds[lIndex], IPPROTO_TCP, TCP_NODELAY, &lOne, sizeof lOne);
+    fcntl(aFds[lIndex], F_SETFL, fcntl(aFds[lIndex], F_GETFL) | O_NONBLOCK);
+  }
+  constexpr size_t kBody = 64;
+  std::thread lEcho([&] {
+    unsigned char lMessage[sizeof(unsigned int) + kBody];
+    while (pollReadAll(aFds[1], lMessage, sizeof lMessage)) {
+      writeAll(aFds[1], lMessage, sizeof(unsigned int));
+      writeAll(aFds[1], lMessage + sizeof(unsigned int), kBody);
+    }
+  });
+  unsigned char lMessage[sizeof(unsigned int) + kBody] = {kBody};
+  for (auto _ : arState) {
+    writeAll(aFds[0], lMessage, sizeof(unsigned int));
+    writeAll(aFds[0], lMessage + sizeof(unsigned int), kBody);
+    pollReadAll(aFds[0], lMessage, sizeof lMessage);
+  }
+  shutdown(aFds[0], SHUT_WR);
+  lEcho.join();
+  close(aFds[0]);
+  close(aFds[1]);
+  arState.SetItemsProcessed(arState.iterations());
+}
+
 void BM_RoundTripTcpLoopback(benchmark::State& arState) {
   int lFds[2];
   tcpPair(lFds);
@@ -141,11 +229,26 @@ void BM_RoundTripSocketPair(benchmark::State& arState) {
   roundTrips(arState, lFds);
 }
 
+void BM_RawRoundTripTcpLoopback(benchmark::State& arState) {
+  int lFds[2];
+  tcpPair(lFds);
+  rawRoundTrips(arState, lFds);
+}
+
+void BM_RawRoundTripSocketPair(benchmark::State& arState) {
+  int lFds[2];
+  socketpair(AF_UNIX, SOCK_STREAM, 0, lFds);
+  rawRoundTrips(arState, lFds);
+}
+
 }  // namespace
 
 BENCHMARK(BM_FramedSocketPair)->Arg(64)->Arg(1024)->Arg(65536);
 BENCHMARK(BM_RawSocketPair)->Arg(64)->Arg(1024)->Arg(65536);
+BENCHMARK(BM_RawSplitSocketPair)->Arg(64)->Arg(1024)->Arg(65536);
 BENCHMARK(BM_RoundTripTcpLoopback)->UseRealTime();
 BENCHMARK(BM_RoundTripSocketPair)->UseRealTime();
+BENCHMARK(BM_RawRoundTripTcpLoopback)->UseRealTime();
+BENCHMARK(BM_RawRoundTripSocketPair)->UseRealTime();
 
 QN_BENCHMARK_MAIN()
