@@ -9,7 +9,8 @@
 // cost of the call sequence.
 //
 // Each benchmark measures the contenders in the same run, round by round: every iteration
-// hands one batch through each (the order rotates between rounds). The counters give each
+// hands one batch through each (Stream and PingPong rotate the order between rounds; OneThread,
+// with nothing to contend for, keeps it). The counters give each
 // contender's rate over all rounds and the ratios (system / baseline, system / same locks);
 // the benchmark's own time is the system object's.
 //
@@ -206,7 +207,8 @@ void reportRates(benchmark::State& arState, double aBaselineSeconds, double aSys
   arState.counters["ratio"] = aBaselineSeconds / aSystemSeconds;
 }
 
-void reportSameLocks(benchmark::State& arState, double aSameLocksSeconds, double aSystemSeconds, double aCount) {
+void reportSameLocks(benchmark::State& arState, double aSameLocksSeconds, double aSystemSeconds,
+                     double aCount) {
   arState.counters["same_locks_per_s"] = aCount / aSameLocksSeconds;
   arState.counters["same_locks_ratio"] = aSameLocksSeconds / aSystemSeconds;
 }
