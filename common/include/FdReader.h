@@ -41,8 +41,6 @@ class QNCFdReader : public QNCReader {
   // the middle of a message.
   bool atEndOfStream();
 
-  int getFd() const { return mFd; }
-
  private:
   QNCMutex mLock;  // guards everything below
   int mFd;

@@ -29,8 +29,6 @@ class QNCFdWriter : public QNCWriter {
 
   void write(const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount) override;
 
-  int getFd() const { return mFd; }
-
  private:
   QNCMutex mLock;  // serialises write()
   int mFd;

@@ -47,9 +47,8 @@ class QNCProtocolHelper {
   virtual void read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer, unsigned int acSize);
 
   // Writes one message whose body is the buffer's used bytes.
-  virtual void write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer, bool acWithoutSize);
-
-  unsigned int getMaxMessageSize() const { return mMaxMessageSize; }
+  virtual void write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer,
+                     bool acWithoutSize);
 
  private:
   void __readSize(QNCPointer<QNCReader>& arReader, unsigned int& arSize);
