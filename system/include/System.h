@@ -20,20 +20,27 @@
 // Threads: the lifecycle operations run on the main thread. The services (buffers, identifiers,
 // conditionals, channels, queues, lists, settings reads, the exit flag) may be called from any
 // thread once start-up has finished. Locks: mExitLock guards mExitFlag only; mNidCreationLock
-// guards mNumericIdManager only; each conditional, queue, list and buffer bucket has its own.
-// The only nesting is a conditional's lock held while a list's or queue's lock is taken for an
-// emptiness test; the reverse never happens.
+// guards mNumericIdManager only; each conditional, queue, list, buffer bucket and channel end has
+// its own. Where two are held together, the order is, outermost first:
+//   1. a conditional's lock (waitOnEmptyQueue/waitOnEmptyList hold it around their emptiness
+//      test; an application may test its own condition under it);
+//   2. a list's or queue's lock for that emptiness test, or mExitLock for isSetForExit() called
+//      under a conditional's lock (the example service's consumer does so);
+//   3. the logger's own locks: a line may be logged while any other lock is held.
+// No lock is taken while one of a later rank is held. The library never holds two locks of one
+// rank together, and a bucket's lock, mNidCreationLock and a channel end's lock only ever have
+// the logger's locks inside them.
 //
 // Numbers given to the numbered services are checked by assertions: a number out of range is a
 // bug of the caller and ends the process with exit status 1.
 
+#include "CommandLineParser.h"
 #include "Os.h"
 #include "Pointer.h"
 #include "QNList.h"
 #include "QNMap.h"
 #include "QNString.h"
 #include "QNVector.h"
-#include "CommandLineParser.h"
 #include "SystemInterface.h"
 
 class QNCBuffer;
@@ -157,9 +164,9 @@ class QNCSystem : public QNCSystemInterface {
   // --- Numbered synchronised queues (SynchQueue.h) and lists (SynchList.h). Every operation is
   // safe from any thread; element order, exceptions and locking are the companion's.
   // waitOnEmptyQueue/waitOnEmptyList: block without a time limit until queue/list n holds an
-  // element, testing it under conditional acConditionNo's lock and waiting on that conditional;
-  // return at once when it already holds one (waitOnEmptyList then does not even take the
-  // conditional's lock, so a busy consumer does not contend with its producers' signal()).
+  // element, testing it under conditional acConditionNo's lock and waiting on that conditional.
+  // When it already holds one they still take that lock for the one test, then release it and
+  // return without waiting; a busy consumer therefore meets its producers' signal() on that lock.
   // They neither remove the element (another consumer may take it before the caller's
   // dequeue/delist) nor look at the exit flag (see timedWait for a wait that ends on request).
   // The conditional's lock is released before any exception leaves.
