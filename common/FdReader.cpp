@@ -27,13 +27,7 @@ QNCFdReader::QNCFdReader(int aFd, bool aOwnsFd, unsigned int aStagingSize, unsig
 
 QNCFdReader::~QNCFdReader() {
   delete[] mpStaging;
-  if (mOwnsFd) {
-    try {
-      ClibClose(mFd);
-    } catch (QNCException&) {
-      // Nothing can be done about a failed close in a destructor; the descriptor is gone anyway.
-    }
-  }
+  if (mOwnsFd) ClibCloseQuietly(mFd);
 }
 
 void QNCFdReader::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) {

@@ -10,13 +10,7 @@ QNCFdWriter::QNCFdWriter(int aFd, bool aOwnsFd, unsigned int aTimeoutMs)
 }
 
 QNCFdWriter::~QNCFdWriter() {
-  if (mOwnsFd) {
-    try {
-      ClibClose(mFd);
-    } catch (QNCException&) {
-      // Nothing can be done about a failed close in a destructor; the descriptor is gone anyway.
-    }
-  }
+  if (mOwnsFd) ClibCloseQuietly(mFd);
 }
 
 void QNCFdWriter::write(const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount) {

@@ -48,18 +48,16 @@ std::string readWholeFile(const QNCString& acrPath) {
       try {
         lRead = ClibRead(lFd, lChunk, sizeof lChunk);
       } catch (const QNCReadFailedEx& acrException) {
-        char lQuoted[QNCException::kMaxMessage / 2];
-        snprintf(lQuoted, sizeof lQuoted, "'%s'", acrPath.get());
-        OsThrowError<QNCReadFailedEx>(static_cast<int>(acrException.getCode()), "read", lQuoted);
+        OsThrowPathError<QNCReadFailedEx>(static_cast<int>(acrException.getCode()), "read", acrPath.get());
       }
       if (lRead == 0) break;
       lContents.append(lChunk, lRead);
     }
   } catch (const std::bad_alloc&) {
-    ClibClose(lFd);
+    ClibCloseQuietly(lFd);
     throw QNCNoMemoryEx("Out of Memory", 2);
   } catch (...) {
-    ClibClose(lFd);
+    ClibCloseQuietly(lFd);
     throw;
   }
   ClibClose(lFd);
@@ -73,7 +71,8 @@ template <class E>
 }
 }  // namespace
 
-QNCKeyValueFormatParser::QNCKeyValueFormatParser(const QNCString& acrFilePath, const QNCString& acrCommentMarkers,
+QNCKeyValueFormatParser::QNCKeyValueFormatParser(const QNCString& acrFilePath,
+                                                 const QNCString& acrCommentMarkers,
                                                  bool aCaseInsensitiveKeys, bool aAllowDuplicateKeys)
     : mFilePath(acrFilePath),
       mCommentMarkers(acrCommentMarkers.isEmpty() ? QNCString("#;") : acrCommentMarkers),
@@ -110,7 +109,8 @@ void QNCKeyValueFormatParser::parse(const QNCString& acrFilePath) {
       const std::string lIndexKey = mCaseInsensitiveKeys ? foldCase(lKey) : lKey;
       const auto lFound = lIndex.find(lIndexKey);
       if (lFound == lIndex.end()) {
-        QNSEntry* lpEntry = new (std::nothrow) QNSEntry{QNCString(lKey.c_str()), QNCString(lValue.c_str()), lLineNo};
+        QNSEntry* lpEntry =
+            new (std::nothrow) QNSEntry{QNCString(lKey.c_str()), QNCString(lValue.c_str()), lLineNo};
         lEntries.append(QNCPointer<QNSEntry>(lpEntry, QNPST_Individual, QNPAT_New));
         lIndex.emplace(lIndexKey, lEntries.numberOfElements() - 1);
       } else if (mAllowDuplicateKeys) {
@@ -119,9 +119,9 @@ void QNCKeyValueFormatParser::parse(const QNCString& acrFilePath) {
         arEntry.mValue = QNCString(lValue.c_str());
         arEntry.mLine = lLineNo;
       } else {
-        throwAt<QNCExistsEx>(acrFilePath, lLineNo,
-                             "key '" + lKey + "' already set on line " +
-                                 std::to_string(lEntries[lFound->second]->mLine));
+        throwAt<QNCExistsEx>(
+            acrFilePath, lLineNo,
+            "key '" + lKey + "' already set on line " + std::to_string(lEntries[lFound->second]->mLine));
       }
     }
   } catch (const std::bad_alloc&) {
@@ -153,15 +153,17 @@ unsigned int QNCKeyValueFormatParser::getUnsigned(const QNCString& acrKey) const
     lValid = lValid && lNumber <= 0xFFFFFFFFull;  // checked per digit, so it cannot wrap
   }
   if (!lValid) {
-    throwAt<QNCInvalidEx>(mFilePath, acrEntry.mLine,
-                          std::string("key '") + acrEntry.mKey.get() + "' expects a number, got '" + lpText + "'");
+    throwAt<QNCInvalidEx>(
+        mFilePath, acrEntry.mLine,
+        std::string("key '") + acrEntry.mKey.get() + "' expects a number, got '" + lpText + "'");
   }
   return static_cast<unsigned int>(lNumber);
 }
 
 void QNCKeyValueFormatParser::getKeys(QNCVector<QNCString>& arKeys) const {
   QNCVector<QNCString> lKeys(mEntries.numberOfElements());
-  for (unsigned int lIndex = 0; lIndex < mEntries.numberOfElements(); ++lIndex) lKeys.append(mEntries[lIndex]->mKey);
+  for (unsigned int lIndex = 0; lIndex < mEntries.numberOfElements(); ++lIndex)
+    lKeys.append(mEntries[lIndex]->mKey);
   arKeys = lKeys;
 }
 
@@ -176,6 +178,7 @@ const QNCKeyValueFormatParser::QNSEntry& QNCKeyValueFormatParser::_find(const QN
   for (unsigned int lIndex = 0; lIndex < mEntries.numberOfElements(); ++lIndex) {
     if (_sameKey(mEntries[lIndex]->mKey, acrKey)) return *mEntries[lIndex];
   }
-  const std::string lMessage = std::string("key '") + acrKey.get() + "' not found in '" + mFilePath.get() + "'";
+  const std::string lMessage =
+      std::string("key '") + acrKey.get() + "' not found in '" + mFilePath.get() + "'";
   throw QNCNotFoundEx(lMessage.c_str(), 8);
 }

@@ -24,15 +24,6 @@ constexpr unsigned int kKillAttempts = 10;
 constexpr unsigned long kKillAttemptPauseMs = 1000;
 
 static_assert(sizeof(int) == kPidBytes, "the PID file holds a 4-byte process id");
-
-// Closing a descriptor of our own after the operation already failed or succeeded: its failure
-// changes nothing for the caller, whose result is already decided.
-void closeQuietly(int aFd) {
-  try {
-    ClibClose(aFd);
-  } catch (QNCCloseFailedEx&) {
-  }
-}
 }  // namespace
 
 QNCProcessInstanceManager::QNCProcessInstanceManager(const QNCString& acrPidFilePath)
@@ -43,7 +34,7 @@ QNCProcessInstanceManager::QNCProcessInstanceManager(const QNCString& acrPidFile
 
 QNCProcessInstanceManager::~QNCProcessInstanceManager() {
   QN_ENTERED();
-  if (mPidFileFd > 0) closeQuietly(mPidFileFd);
+  if (mPidFileFd > 0) ClibCloseQuietly(mPidFileFd);
   QN_LEFT();
 }
 
@@ -89,8 +80,7 @@ bool QNCProcessInstanceManager::_isSignallable(unsigned int aBytesRead, int aPid
                  aBytesRead, kPidBytes);
     return false;
   }
-  // kill(0, ...) signals our own process group and kill(-n, ...) a whole group or everyone.
-  if (aPid <= 0) {
+  if (!OsNamesOneProcess(aPid)) {
     QN_LOG_ERROR("PID file %s holds process id %d, which names no single process... cannot kill",
                  mPidFilePath.get(), aPid);
     return false;
@@ -164,7 +154,7 @@ void QNCProcessInstanceManager::getProcStatusFromPidFile(QNCString aPidFilePath)
   try {
     if (ClibRead(lFd, &lPid, kPidBytes) < kPidBytes) lPid = 0;  // a short file names no process
   } catch (QNCReadFailedEx&) {
-    closeQuietly(lFd);
+    ClibCloseQuietly(lFd);
     QN_LOG_TRACE("Couldn't read from the pid file");
     throw;
   }
@@ -173,10 +163,10 @@ void QNCProcessInstanceManager::getProcStatusFromPidFile(QNCString aPidFilePath)
     ClibGetProcStatus(lPid);
   } catch (QNCClibGetProcStatusFailedEx&) {
     QN_LOG_TRACE("Failed in getting the process status");
-    closeQuietly(lFd);
+    ClibCloseQuietly(lFd);
     throw;
   }
-  closeQuietly(lFd);
+  ClibCloseQuietly(lFd);
   QN_LEFT();
 }
 

@@ -1,7 +1,6 @@
 #include "Clib.h"
 
 #include <fcntl.h>
-#include <signal.h>
 #include <sys/stat.h>
 #include <time.h>
 #include <unistd.h>
@@ -11,7 +10,9 @@
 #include <cstdio>
 #include <cstring>
 
+#include "Os.h"
 #include "OsError.h"
+#include "OsStream.h"
 
 namespace {
 // Sleeps for the given time, to a deadline on the monotonic clock. An absolute deadline makes every signal
@@ -48,20 +49,10 @@ unsigned int ClibRead(int aFd, void* apBuffer, unsigned int aCount) {
 }
 
 unsigned int ClibWrite(int aFd, const void* apBuffer, unsigned int aCount) {
-  const char* lpBytes = static_cast<const char*>(apBuffer);
-  unsigned int lWritten = 0;
-  while (lWritten < aCount) {
-    const ssize_t lResult = write(aFd, lpBytes + lWritten, aCount - lWritten);
-    if (lResult > 0) {
-      // A signal during a blocked write ends it early with the bytes written so far: go on.
-      lWritten += static_cast<unsigned int>(lResult);
-      continue;
-    }
-    const int lErrno = lResult < 0 ? errno : EIO;  // 0 bytes for a non-zero count: no progress possible
-    if (lErrno == EINTR) continue;                 // interrupted before anything was written
-    OsThrowFdError<QNCWriteFailedEx>(lErrno, "write", aFd);
-  }
-  return lWritten;
+  unsigned long lWritten = 0;
+  const int lErrno = OsWriteFully(aFd, apBuffer, aCount, QNPS_Raise, lWritten);
+  if (lErrno != 0) OsThrowFdError<QNCWriteFailedEx>(lErrno, "write", aFd);
+  return aCount;
 }
 
 void ClibClose(int aFd) {
@@ -70,6 +61,12 @@ void ClibClose(int aFd) {
   if (close(aFd) == 0) return;
   const int lErrno = errno;
   if (lErrno != EINTR) OsThrowFdError<QNCCloseFailedEx>(lErrno, "close", aFd);
+}
+
+void ClibCloseQuietly(int aFd) noexcept {
+  // The result is not looked at: the descriptor is released whatever close reports, and the
+  // caller's outcome is already decided. Never retried, for the reason given in ClibClose.
+  (void)close(aFd);
 }
 
 void ClibStat(const char* apPath, struct stat* apOut) {
@@ -84,13 +81,11 @@ void ClibStat(const char* apPath, struct stat* apOut) {
 int ClibGetpid() { return static_cast<int>(getpid()); }
 
 int ClibGetProcStatus(int aPid) {
-  char lPid[24];
-  snprintf(lPid, sizeof lPid, "pid %d", aPid);
-  // kill(0, …) and kill(-n, …) address process groups, kill(-1, …) every process: never probe them.
-  if (aPid <= 0) OsThrowError<QNCClibGetProcStatusFailedEx>(EINVAL, "kill(signal 0)", lPid);
-  if (kill(aPid, 0) == 0) return 0;
+  if (OsKill(aPid, 0) == 0) return 0;  // OsKill refuses a pid that names a group (EINVAL)
   const int lErrno = errno;
   if (lErrno == EPERM) return 0;  // the process exists but belongs to another user
+  char lPid[24];
+  snprintf(lPid, sizeof lPid, "pid %d", aPid);
   OsThrowError<QNCClibGetProcStatusFailedEx>(lErrno, "kill(signal 0)", lPid);
 }
 

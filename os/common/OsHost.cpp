@@ -12,10 +12,10 @@
 #include "Os.h"
 #include "QNString.h"
 
+bool OsNamesOneProcess(int aPid) { return aPid > 0; }
+
 int OsKill(int aPid, int aSignal) {
-  // kill(0, …) signals the caller's whole process group and kill(-1, …) every process it may
-  // signal: a pid of 0 or below (a PID file with bad contents) must never get that far.
-  if (aPid <= 0) {
+  if (!OsNamesOneProcess(aPid)) {
     errno = EINVAL;
     return -1;
   }

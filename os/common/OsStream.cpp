@@ -16,11 +16,6 @@
 #include "OsError.h"
 
 namespace {
-struct QNSFdName {
-  explicit QNSFdName(int aFd) { snprintf(mText, sizeof mText, "fd %d", aFd); }
-  char mText[24];
-};
-
 long long nowMs() {
   struct timespec lNow;
   clock_gettime(CLOCK_MONOTONIC, &lNow);
@@ -50,9 +45,16 @@ long writeWithoutSigpipe(int aFd, const void* apBuffer, unsigned long aCount) {
   return lResult;
 }
 
-long writeSome(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCount) {
-  if (aIsSocket) return send(aFd, apBuffer, aCount, MSG_NOSIGNAL);
-  return writeWithoutSigpipe(aFd, apBuffer, aCount);
+long writeSome(int aFd, QNEPipeSignal aPipeSignal, const void* apBuffer, unsigned long aCount) {
+  switch (aPipeSignal) {
+    case QNPS_Socket:
+      return send(aFd, apBuffer, aCount, MSG_NOSIGNAL);
+    case QNPS_Blocked:
+      return writeWithoutSigpipe(aFd, apBuffer, aCount);
+    case QNPS_Raise:
+      break;
+  }
+  return write(aFd, apBuffer, aCount);
 }
 }  // namespace
 
@@ -65,7 +67,7 @@ bool OsIsSocket(int aFd) {
 void OsSetNonBlocking(int aFd) {
   const int lFlags = fcntl(aFd, F_GETFL);
   if (lFlags < 0 || fcntl(aFd, F_SETFL, lFlags | O_NONBLOCK) != 0)
-    OsThrowError<QNCOsException>(errno, "fcntl(O_NONBLOCK)", QNSFdName(aFd).mText);
+    OsThrowFdError<QNCOsException>(errno, "fcntl(O_NONBLOCK)", aFd);
 }
 
 long OsReadSome(int aFd, void* apBuffer, unsigned long aCount) {
@@ -74,35 +76,52 @@ long OsReadSome(int aFd, void* apBuffer, unsigned long aCount) {
     if (lRead >= 0) return lRead;
     if (errno == EINTR) continue;  // nothing was read: read again
     if (errno == EAGAIN || errno == EWOULDBLOCK) return -1;
-    OsThrowError<QNCReadFailedEx>(errno, "read", QNSFdName(aFd).mText);
+    OsThrowFdError<QNCReadFailedEx>(errno, "read", aFd);
   }
 }
 
-void OsWriteAll(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCount, unsigned int aTimeoutMs) {
+int OsWriteFully(int aFd, const void* apBuffer, unsigned long aCount, QNEPipeSignal aPipeSignal,
+                 unsigned long& arWritten) noexcept {
+  const char* lpBytes = static_cast<const char*>(apBuffer);
+  arWritten = 0;
+  while (arWritten < aCount) {
+    const long lResult = writeSome(aFd, aPipeSignal, lpBytes + arWritten, aCount - arWritten);
+    if (lResult > 0) {
+      // A signal during a blocked write ends it early with the bytes written so far: go on.
+      arWritten += static_cast<unsigned long>(lResult);
+      continue;
+    }
+    if (lResult == 0) return EIO;  // no byte taken for a non-zero count: no progress possible
+    const int lErrno = errno;
+    if (lErrno == EINTR) continue;  // interrupted before any byte went out
+    return lErrno == EWOULDBLOCK ? EAGAIN : lErrno;
+  }
+  return 0;
+}
+
+void OsWriteAll(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCount,
+                unsigned int aTimeoutMs) {
   const char* lpBytes = static_cast<const char*>(apBuffer);
   const long long lDeadline = nowMs() + aTimeoutMs;
   unsigned long lWritten = 0;
-  while (lWritten < aCount) {
-    const long lResult = writeSome(aFd, aIsSocket, lpBytes + lWritten, aCount - lWritten);
-    if (lResult > 0) {
-      lWritten += static_cast<unsigned long>(lResult);
-      continue;
+  for (;;) {
+    unsigned long lMore = 0;
+    const int lErrno = OsWriteFully(aFd, lpBytes + lWritten, aCount - lWritten,
+                                    aIsSocket ? QNPS_Socket : QNPS_Blocked, lMore);
+    lWritten += lMore;
+    if (lErrno == 0) return;
+    if (lErrno != EAGAIN) OsThrowFdError<QNCWriteFailedEx>(lErrno, "write", aFd);
+    const long long lLeft = aTimeoutMs == 0 ? -1 : lDeadline - nowMs();
+    if (aTimeoutMs != 0 && lLeft <= 0) {
+      char lFd[QNCException::kMaxMessage / 2];
+      OsDescribeFd(lFd, sizeof lFd, aFd);
+      char lMessage[QNCException::kMaxMessage];
+      snprintf(lMessage, sizeof lMessage, "write %s: peer did not drain within %u ms", lFd, aTimeoutMs);
+      throw QNCTimeOutEx(lMessage, ETIMEDOUT);
     }
-    if (lResult < 0 && errno == EINTR) continue;  // interrupted before any byte went out
-    if (lResult < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
-      long long lLeft = aTimeoutMs == 0 ? -1 : lDeadline - nowMs();
-      if (aTimeoutMs != 0 && lLeft <= 0) {
-        char lMessage[96];
-        snprintf(lMessage, sizeof lMessage, "write %s: peer did not drain within %u ms", QNSFdName(aFd).mText,
-                 aTimeoutMs);
-        throw QNCTimeOutEx(lMessage, ETIMEDOUT);
-      }
-      struct pollfd lPoll = {aFd, POLLOUT, 0};
-      // Errors and hang-ups show in the next write's result, so poll's own result is not needed.
-      (void)poll(&lPoll, 1, lLeft > INT_MAX ? INT_MAX : static_cast<int>(lLeft));
-      continue;
-    }
-    OsThrowError<QNCWriteFailedEx>(lResult == 0 ? EIO : errno, "write", QNSFdName(aFd).mText);
+    struct pollfd lPoll = {aFd, POLLOUT, 0};
+    // Errors and hang-ups show in the next write's result, so poll's own result is not needed.
+    (void)poll(&lPoll, 1, lLeft > INT_MAX ? INT_MAX : static_cast<int>(lLeft));
   }
 }
 
@@ -114,7 +133,7 @@ bool OsWaitReadable(int aFd, unsigned int aTimeoutMs) {
     const int lReady = poll(&lPoll, 1, lLeft <= 0 ? 0 : lLeft > INT_MAX ? INT_MAX : static_cast<int>(lLeft));
     if (lReady > 0) return true;
     if (lReady == 0) return false;
-    if (errno != EINTR) OsThrowError<QNCOsException>(errno, "poll", QNSFdName(aFd).mText);
+    if (errno != EINTR) OsThrowFdError<QNCOsException>(errno, "poll", aFd);
     // Interrupted: wait on for the time that is left.
   }
 }
@@ -131,5 +150,5 @@ void OsDisableNagleIfTcp(int aFd) {
   // The framing helper writes a prefix and a body per message; with Nagle's algorithm the body
   // waits for the peer's delayed acknowledgement of the prefix (about 40 ms each way).
   if (setsockopt(aFd, IPPROTO_TCP, TCP_NODELAY, &lOn, sizeof lOn) != 0)
-    OsThrowError<QNCOsException>(errno, "setsockopt(TCP_NODELAY)", QNSFdName(aFd).mText);
+    OsThrowFdError<QNCOsException>(errno, "setsockopt(TCP_NODELAY)", aFd);
 }

@@ -22,14 +22,20 @@ int ClibOpen(const char* apPath, int aFlags, int aMode);
 // Throws QNCReadFailedEx (EAGAIN included, on a non-blocking descriptor with nothing to read).
 unsigned int ClibRead(int aFd, void* apBuffer, unsigned int aCount);
 
-// write(2) of the whole count: partial writes are continued until every byte is written. Returns
-// aCount. Blocks as write does. Throws QNCWriteFailedEx; bytes written before the failure stay
+// write(2) of the whole count through OsWriteFully (OsStream.h): partial writes are continued
+// until every byte is written. Returns aCount. Blocks as write does. Throws QNCWriteFailedEx,
+// EAGAIN included (a full non-blocking descriptor); bytes written before the failure stay
 // written.
 unsigned int ClibWrite(int aFd, const void* apBuffer, unsigned int aCount);
 
 // close(2). Throws QNCCloseFailedEx (EBADF, EIO). An EINTR is taken as success: Linux has already
 // released the descriptor, and closing again could close one another thread was just given.
 void ClibClose(int aFd);
+
+// close(2) of a descriptor its owner is done with, where a failure could change nothing (a
+// destructor, the clean-up after the result is decided). Ignores every error and, like
+// ClibClose, never retries. Never throws.
+void ClibCloseQuietly(int aFd) noexcept;
 
 // stat(2). Throws QNCClibStatFailedEx, also when the file does not exist (code ENOENT).
 void ClibStat(const char* apPath, struct stat* apOut);
@@ -39,8 +45,8 @@ int ClibGetpid();
 
 // Returns 0 when process aPid exists, also when it belongs to another user (the system then
 // refuses the probe with EPERM). Throws QNCClibGetProcStatusFailedEx when it does not exist
-// (ESRCH), and when aPid is not positive (EINVAL): 0 and below name process groups, not one
-// process. Sends no signal.
+// (ESRCH), and when aPid names no single process (EINVAL, see OsNamesOneProcess). Sends no
+// signal.
 int ClibGetProcStatus(int aPid);
 
 // Sleep the calling thread for the whole time, measured on the monotonic clock, going on after

@@ -82,9 +82,13 @@ void OsFileLockStatus(int aFd, QNEFileLockStatus& arStatus);
 
 // ---- Processes and host.
 
+// True when aPid can name one process, that is when it is positive. kill(2) reads 0 as the
+// caller's process group, -1 as every process it may signal and -n as group n, so a pid of 0 or
+// below (a PID file with bad contents) must never reach it. The one place that tells.
+bool OsNamesOneProcess(int aPid);
+
 // Sends aSignal to the one process aPid; aSignal 0 only checks that it may be sent. Returns 0, or
-// -1 with errno set on failure. A pid that is not positive is refused with EINVAL: kill(2) would
-// read it as a process group or as every process.
+// -1 with errno set on failure. A pid that names no single process is refused with EINVAL.
 int OsKill(int aPid, int aSignal);
 
 // Writes the kind (QNOS_Linux on Linux) and the variant text "<sysname> <release> <machine>" from
