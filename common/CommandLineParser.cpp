@@ -21,16 +21,12 @@ bool isBlank(char aChar) { return aChar == ' ' || aChar == '\t'; }
 // The words of acrLine; runs of blanks separate words, and blanks at either end are ignored.
 std::vector<std::string> splitWords(const QNCString& acrLine) {
   std::vector<std::string> lWords;
-  try {
-    const char* lpCursor = acrLine.get();
-    while (*lpCursor != '\0') {
-      while (isBlank(*lpCursor)) ++lpCursor;
-      const char* lpStart = lpCursor;
-      while (*lpCursor != '\0' && !isBlank(*lpCursor)) ++lpCursor;
-      if (lpCursor != lpStart) lWords.emplace_back(lpStart, lpCursor);
-    }
-  } catch (const std::bad_alloc&) {
-    throw QNCNoMemoryEx("Out of Memory", 2);
+  const char* lpCursor = acrLine.get();
+  while (*lpCursor != '\0') {
+    while (isBlank(*lpCursor)) ++lpCursor;
+    const char* lpStart = lpCursor;
+    while (*lpCursor != '\0' && !isBlank(*lpCursor)) ++lpCursor;
+    if (lpCursor != lpStart) QNNoMemoryToException([&] { lWords.emplace_back(lpStart, lpCursor); });
   }
   return lWords;
 }
@@ -50,7 +46,8 @@ void QNCCommandLineParser::run() {
     const QNSCommandLineArgumentDesc* lpDesc = _findDesc(lpWord);
     if (lpDesc == nullptr) {
       if (lpWord[0] == '-') throwBadCommandLine("Unknown option '%s'", lpWord);
-      if (lpPreviousFlag != nullptr) throwBadCommandLine("Option '%s' takes no value, got '%s'", lpPreviousFlag, lpWord);
+      if (lpPreviousFlag != nullptr)
+        throwBadCommandLine("Option '%s' takes no value, got '%s'", lpPreviousFlag, lpWord);
       throwBadCommandLine("Unexpected argument '%s'", lpWord);
     }
     for (unsigned int lSeen = 0; lSeen < lArguments.numberOfElements(); ++lSeen) {
@@ -61,9 +58,9 @@ void QNCCommandLineParser::run() {
       if (lIndex + 1 == lWords.size() || _findDesc(lWords[lIndex + 1].c_str()) != nullptr)
         throwBadCommandLine("Option '%s' needs a value", lpWord);
       ++lIndex;
-      lArguments.append(QNCPointer<QNCCommandLineArgument>(
-          QNCPointer<QNCOptionValueArgument>(new (std::nothrow) QNCOptionValueArgument(lpWord, lWords[lIndex].c_str()),
-                                             QNPST_Individual, QNPAT_New)));
+      lArguments.append(QNCPointer<QNCCommandLineArgument>(QNCPointer<QNCOptionValueArgument>(
+          new (std::nothrow) QNCOptionValueArgument(lpWord, lWords[lIndex].c_str()), QNPST_Individual,
+          QNPAT_New)));
       lpPreviousFlag = nullptr;
     } else {
       lArguments.append(QNCPointer<QNCCommandLineArgument>(new (std::nothrow) QNCCommandLineArgument(lpWord),
@@ -75,7 +72,8 @@ void QNCCommandLineParser::run() {
   mState = QNCLPS_Parsed;
 }
 
-void QNCCommandLineParser::getArgument(const QNCString& aOption, QNCPointer<QNCCommandLineArgument>& aArgument) {
+void QNCCommandLineParser::getArgument(const QNCString& aOption,
+                                       QNCPointer<QNCCommandLineArgument>& aArgument) {
   const unsigned int lIndex = _indexOfArgument(aOption.get());
   if (lIndex == mArguments.numberOfElements()) {
     char lMessage[QNCException::kMaxMessage];
@@ -90,7 +88,8 @@ const QNSCommandLineArgumentDesc* QNCCommandLineParser::_findDesc(const char* ap
     const QNSCommandLineArgumentDesc& lrDesc = mArgumentDesc[lIndex];
     // Bounded: a descriptor is application data and might fill its array without a NUL.
     const size_t lLength = strnlen(lrDesc.mOption, sizeof lrDesc.mOption);
-    if (lLength != 0 && strncmp(lrDesc.mOption, apWord, lLength) == 0 && apWord[lLength] == '\0') return &lrDesc;
+    if (lLength != 0 && strncmp(lrDesc.mOption, apWord, lLength) == 0 && apWord[lLength] == '\0')
+      return &lrDesc;
   }
   return nullptr;
 }

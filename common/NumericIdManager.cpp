@@ -6,7 +6,8 @@
 #include "Logger.h"
 #include "QNException.h"
 
-QNCNumericIdManager::QNCNumericIdManager(unsigned int aUpperBound) : mUpperBound(aUpperBound), mHighestIssued(0) {
+QNCNumericIdManager::QNCNumericIdManager(unsigned int aUpperBound)
+    : mUpperBound(aUpperBound), mHighestIssued(0) {
   QN_ENTERED();
   QN_LEFT();
 }
@@ -26,7 +27,8 @@ void QNCNumericIdManager::getNextId(unsigned int& arId) {
   }
   if (mHighestIssued == mUpperBound) {
     char lMessage[96];
-    snprintf(lMessage, sizeof lMessage, "No numeric identifier is free: all of 1..%u are in use", mUpperBound);
+    snprintf(lMessage, sizeof lMessage, "No numeric identifier is free: all of 1..%u are in use",
+             mUpperBound);
     throw QNCNotFoundEx(lMessage, 8);
   }
   arId = ++mHighestIssued;
@@ -39,14 +41,10 @@ void QNCNumericIdManager::markForReuse(unsigned int aId) {
     throw QNCInvalidEx(lMessage, 6);
   }
   if (mReusableSet.isNull()) {
-    mReusableSet = QNCPointer<std::unordered_set<unsigned int>>(new (std::nothrow) std::unordered_set<unsigned int>,
-                                                                QNPST_Individual, QNPAT_New);
+    mReusableSet = QNCPointer<std::unordered_set<unsigned int>>(
+        new (std::nothrow) std::unordered_set<unsigned int>, QNPST_Individual, QNPAT_New);
   }
-  try {
-    mReusableSet->insert(aId);
-  } catch (const std::bad_alloc&) {
-    throw QNCNoMemoryEx("Out of Memory", 2);
-  }
+  QNNoMemoryToException([&] { mReusableSet->insert(aId); });
   try {
     mReusable.pushBack(aId);
   } catch (...) {

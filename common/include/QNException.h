@@ -13,6 +13,8 @@
 //
 // Immutable after construction: safe to read from any thread.
 
+#include <new>
+
 class QNCException {
  public:
   static constexpr unsigned int kMaxMessage = 1024;
@@ -45,15 +47,14 @@ const char* QNCurrentExceptionText() noexcept;
 
 // Declares one member of the family. Categories keep a protected default constructor so that
 // their descendants initialise the shared root themselves.
-#define QN_DECLARE_EXCEPTION(Name, ...)                                           \
-  class Name : __VA_ARGS__ {                                                    \
-   public:                                                                      \
-    Name(const char* apMessage, unsigned int aCode) noexcept                    \
-        : QNCException(apMessage, aCode) {}                                     \
-    ~Name() override;                                                           \
-                                                                                \
-   protected:                                                                   \
-    Name() noexcept = default;                                                  \
+#define QN_DECLARE_EXCEPTION(Name, ...)                                                          \
+  class Name : __VA_ARGS__ {                                                                     \
+   public:                                                                                       \
+    Name(const char* apMessage, unsigned int aCode) noexcept : QNCException(apMessage, aCode) {} \
+    ~Name() override;                                                                            \
+                                                                                                 \
+   protected:                                                                                    \
+    Name() noexcept = default;                                                                   \
   }
 
 // Categories.
@@ -91,3 +92,15 @@ QN_DECLARE_EXCEPTION(QNCTerminateFailedEx, public virtual QNCOpsException);
 // Failed Clib wrappers.
 QN_DECLARE_EXCEPTION(QNCClibStatFailedEx, public virtual QNCClibEx);
 QN_DECLARE_EXCEPTION(QNCClibGetProcStatusFailedEx, public virtual QNCClibEx);
+
+// Runs acrCall and returns what it returns, reporting a std::bad_alloc from it as the family's
+// QNCNoMemoryEx "Out of Memory" (2): the one place that translates a standard container's
+// allocation failure. Anything else acrCall throws passes unchanged.
+template <class Call>
+decltype(auto) QNNoMemoryToException(const Call& acrCall) {
+  try {
+    return acrCall();
+  } catch (const std::bad_alloc&) {
+    throw QNCNoMemoryEx("Out of Memory", 2);
+  }
+}

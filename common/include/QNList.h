@@ -26,19 +26,10 @@ class QNCList {
   }
 
   void pushBack(const T& acrElement) {
-    try {
-      mList.push_back(acrElement);
-    } catch (const std::bad_alloc&) {
-      throw QNCNoMemoryEx("Out of Memory", 2);
-    }
+    QNNoMemoryToException([&] { mList.push_back(acrElement); });
   }
-
   void pushFront(const T& acrElement) {
-    try {
-      mList.push_front(acrElement);
-    } catch (const std::bad_alloc&) {
-      throw QNCNoMemoryEx("Out of Memory", 2);
-    }
+    QNNoMemoryToException([&] { mList.push_front(acrElement); });
   }
 
   T& front() {
@@ -82,15 +73,13 @@ class QNCList {
   iterator erase(iterator aPosition) noexcept { return mList.erase(aPosition); }
 
   // Moves the element at aPosition of arOther to the end of this list without allocating.
-  void spliceBack(QNCList& arOther, iterator aPosition) noexcept { mList.splice(mList.end(), arOther.mList, aPosition); }
+  void spliceBack(QNCList& arOther, iterator aPosition) noexcept {
+    mList.splice(mList.end(), arOther.mList, aPosition);
+  }
 
  private:
   void _copyFrom(const QNCList& acrCopy) {
-    try {
-      mList = acrCopy.mList;
-    } catch (const std::bad_alloc&) {
-      throw QNCNoMemoryEx("Out of Memory", 2);
-    }
+    QNNoMemoryToException([&] { mList = acrCopy.mList; });
   }
 
   std::list<T> mList;

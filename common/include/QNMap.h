@@ -17,14 +17,7 @@
 template <class K, class V>
 class QNCMap {
  public:
-  V& get(const K& acrKey) {
-    auto lFound = mMap.find(acrKey);
-    if (lFound == mMap.end()) {
-      QN_LOG_INFO("Element does not exist in the map");
-      throw QNCNotFoundEx("No element for the key exists in map", 8);
-    }
-    return lFound->second;
-  }
+  V& get(const K& acrKey) { return const_cast<V&>(static_cast<const QNCMap&>(*this).get(acrKey)); }
 
   const V& get(const K& acrKey) const {
     auto lFound = mMap.find(acrKey);
@@ -36,13 +29,9 @@ class QNCMap {
   }
 
   void insert(const K& acrKey, const V& acrValue) {
-    try {
-      if (!mMap.emplace(acrKey, acrValue).second) {
-        QN_LOG_ERROR("Element already existed in the map");
-        throw QNCExistsEx("Element already exists in map.. can't insert", 10);
-      }
-    } catch (const std::bad_alloc&) {
-      throw QNCNoMemoryEx("Out of Memory", 2);
+    if (!QNNoMemoryToException([&] { return mMap.emplace(acrKey, acrValue).second; })) {
+      QN_LOG_ERROR("Element already existed in the map");
+      throw QNCExistsEx("Element already exists in map.. can't insert", 10);
     }
   }
 

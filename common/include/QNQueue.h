@@ -27,11 +27,7 @@ class QNCQueue {
       if (!mSpare.isEmpty()) {
         // Copy first: should the copy throw, both lists are unchanged. A copy that runs out of
         // memory fails as a fresh node would.
-        try {
-          *mSpare.begin() = acrElement;
-        } catch (const std::bad_alloc&) {
-          throw QNCNoMemoryEx("Out of Memory", 2);
-        }
+        QNNoMemoryToException([&] { *mSpare.begin() = acrElement; });
         mList.spliceBack(mSpare, mSpare.begin());
         return;
       }
@@ -59,13 +55,11 @@ class QNCQueue {
       mSpare.spliceBack(mList, mList.begin());
       return lHead;
     } else {
-      try {
+      return QNNoMemoryToException([&] {
         T lHead = mList.front();
         mList.popFront();
         return lHead;
-      } catch (const std::bad_alloc&) {
-        throw QNCNoMemoryEx("Out of Memory", 2);
-      }
+      });
     }
   }
 

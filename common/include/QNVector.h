@@ -60,11 +60,7 @@ class QNCVector {
 
  private:
   void _copyFrom(const QNCVector& acrCopy) {
-    try {
-      mVector = acrCopy.mVector;
-    } catch (const std::bad_alloc&) {
-      throw QNCNoMemoryEx("Out of Memory", 2);
-    }
+    QNNoMemoryToException([&] { mVector = acrCopy.mVector; });
   }
 
   std::vector<T> mVector;

@@ -46,14 +46,8 @@ long writeWithoutSigpipe(int aFd, const void* apBuffer, unsigned long aCount) {
 }
 
 long writeSome(int aFd, QNEPipeSignal aPipeSignal, const void* apBuffer, unsigned long aCount) {
-  switch (aPipeSignal) {
-    case QNPS_Socket:
-      return send(aFd, apBuffer, aCount, MSG_NOSIGNAL);
-    case QNPS_Blocked:
-      return writeWithoutSigpipe(aFd, apBuffer, aCount);
-    case QNPS_Raise:
-      break;
-  }
+  if (aPipeSignal == QNPS_Socket) return send(aFd, apBuffer, aCount, MSG_NOSIGNAL);
+  if (aPipeSignal == QNPS_Blocked) return writeWithoutSigpipe(aFd, apBuffer, aCount);
   return write(aFd, apBuffer, aCount);
 }
 }  // namespace
