@@ -1,9 +1,11 @@
 #pragma once
 // The log lines of qnsensord whose rate its peers decide. Each kind has its own
 // QNCWarningLimiter with the defaults, so a flood of bad input adds at most 11 lines per second
-// per kind to the log (see WarningLimiter.h): five kinds, at most 55 lines per second in all.
+// per kind to the log (see WarningLimiter.h): five kinds here and the protocol helper's
+// oversized-message line, at most 66 lines per second in all.
 //
-// Threads: any thread. The limiters live until the process exits.
+// Threads: any thread. The limiters live until the process exits; QNFlushPeerWarnings() writes
+// their pending counts before the logger is destroyed.
 
 #include "WarningLimiter.h"
 
