@@ -125,7 +125,7 @@ void QNCLogSink::_writeBatch() {
 }
 
 bool QNCLogSink::open(const char* apPath, unsigned int aMask) {
-  const int lFd = ::open(apPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+  const int lFd = ::open(apPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0640);
   if (lFd < 0) return false;
   _writeBatch();  // what belongs to a log already open goes there
   {

@@ -8,6 +8,7 @@
 #include "Logger.h"
 #include "QNException.h"
 #include "Reader.h"
+#include "WarningLimiter.h"
 #include "Writer.h"
 
 namespace {
@@ -16,6 +17,13 @@ constexpr unsigned int kReadFailedCode = 328;
 
 QNCPointer<QNCBuffer> newBuffer(unsigned int acLength) {
   return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(acLength, 0), QNPST_Individual, QNPAT_New);
+}
+
+// A peer decides how often a message is oversized, so its line is rate-limited (WarningLimiter.h).
+// Made on first use: after the logger's statics, and destroyed before them.
+QNCWarningLimiter& oversizeLines() {
+  static QNCWarningLimiter sLimiter("oversized messages");
+  return sLimiter;
 }
 }  // namespace
 
@@ -36,7 +44,8 @@ void QNCProtocolHelper::read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuff
   unsigned int lreadsize = acSize;
   if (lreadsize == 0) __readSize(arReader, lreadsize);
   if (mMaxMessageSize != 0 && lreadsize > mMaxMessageSize) {
-    QN_LOG_ERROR("Message of %u bytes exceeds the maximum of %u", lreadsize, mMaxMessageSize);
+    if (oversizeLines().admit())
+      QN_LOG_ERROR("Message of %u bytes exceeds the maximum of %u", lreadsize, mMaxMessageSize);
     throw QNCReadFailedEx("Message exceeds the maximum size", kReadFailedCode);
   }
   QN_LOG_TRACE("Creating a buffer of '%u' size for receiving", lreadsize);

@@ -65,7 +65,7 @@ void PrintLogMessageWithTimeStamp(unsigned int aLevel, const char* apTag, unsign
                                   const char* apFunction, const char* apFile, const char* apFormat, ...)
     __attribute__((format(printf, 6, 7)));
 
-// Opens the log at acrPath for appending (created with mode 0644 if missing) and writes the
+// Opens the log at acrPath for appending (created with mode 0640 if missing) and writes the
 // lines kept since start-up. A second call writes out and closes the first log and opens the new
 // path. Never throws; a path that cannot be opened is reported on standard error. Call it from
 // one thread at a time (start-up does).

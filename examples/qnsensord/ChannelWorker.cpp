@@ -4,6 +4,7 @@
 
 #include "Buffer.h"
 #include "Logger.h"
+#include "PeerWarnings.h"
 #include "ProtocolHelper.h"
 #include "Reader.h"
 #include "SensorChannel.h"
@@ -36,7 +37,8 @@ void QNCChannelWorker::_handleMessage() {
   try {
     mSystem.getProtocolHelper()->read(mSystem.getReader(mChannelNo), lMessage, 0);
   } catch (const QNCReadFailedEx& acrFailure) {
-    QN_LOG_WARNING("Channel %u: message lost, connection dropped: %s", mChannelNo, acrFailure.what());
+    if (QNPeerWarning(QNPW_LostMessage).admit())
+      QN_LOG_WARNING("Channel %u: message lost, connection dropped: %s", mChannelNo, acrFailure.what());
     mChannel.dropConnection();
     return;
   }
@@ -47,7 +49,7 @@ void QNCChannelWorker::_handleMessage() {
   lItem->mAccepted = QNParseReading(lBytes, lBytes.getLength(), lItem->mReading, lItem->mSequenceText, lItem->mReason);
   if (lItem->mAccepted) {
     mSystem.generateNumericId(lItem->mId);
-  } else {
+  } else if (QNPeerWarning(QNPW_RefusedReading).admit()) {
     QN_LOG_WARNING("Channel %u: reading %s refused: %s", mChannelNo, lItem->mSequenceText.c_str(),
                    lItem->mReason.c_str());
   }

@@ -6,6 +6,7 @@
 #include "Buffer.h"
 #include "Clib.h"
 #include "Logger.h"
+#include "PeerWarnings.h"
 #include "ProtocolHelper.h"
 #include "SensorChannel.h"
 #include "SensorReading.h"
@@ -50,10 +51,12 @@ void QNCReadingConsumer::_answer(QNCSensorReadingItem& arItem) {
   try {
     mSystem.getProtocolHelper()->write(mSystem.getWriter(arItem.mChannel), lAnswer, false);
   } catch (const QNCWriteFailedEx& acrFailure) {
-    QN_LOG_INFO("Channel %u: answer to reading %s dropped: %s", arItem.mChannel, arItem.mSequenceText.c_str(),
-                acrFailure.what());
+    if (QNPeerWarning(QNPW_DroppedAnswer).admit())
+      QN_LOG_INFO("Channel %u: answer to reading %s dropped: %s", arItem.mChannel, arItem.mSequenceText.c_str(),
+                  acrFailure.what());
   } catch (const QNCTimeOutEx& acrFailure) {
-    QN_LOG_WARNING("Channel %u: client does not read its answers: %s", arItem.mChannel, acrFailure.what());
+    if (QNPeerWarning(QNPW_UnreadAnswer).admit())
+      QN_LOG_WARNING("Channel %u: client does not read its answers: %s", arItem.mChannel, acrFailure.what());
   }
   mSystem.reuseBuffer(lAnswer);
 }

@@ -2,6 +2,7 @@
 
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -11,6 +12,7 @@
 #include <utility>
 
 #include "Logger.h"
+#include "PeerWarnings.h"
 #include "QNException.h"
 
 namespace {
@@ -20,6 +22,43 @@ thread_local unsigned long tlGeneration = 0;
   char lMessage[600];
   snprintf(lMessage, sizeof lMessage, "%s '%s': %s", apCall, acrPath.c_str(), strerror(errno));
   throw QNCOpenFailedEx(lMessage, static_cast<unsigned int>(errno));
+}
+
+[[noreturn]] void refusePath(const std::string& acrPath, const char* apWhy) {
+  char lMessage[600];
+  snprintf(lMessage, sizeof lMessage,
+           "socket path '%s' %s; qnsensord will not replace it (remove it, or give the service a private "
+           "QN_LOG_DIR)",
+           acrPath.c_str(), apWhy);
+  QN_LOG_ERROR("%s", lMessage);
+  throw QNCExistsEx(lMessage, EEXIST);
+}
+
+// Leaves acrPath free for bind. Nothing is there, or a stale socket of our own is: a socket owned
+// by this user that nobody accepts on (connect is refused). Since the caller holds the instance
+// lock, no other qnsensord can be about to serve it: it is what an instance that did not end in
+// order left behind, and it is removed. Anything else -- a file, a directory, a link, another
+// user's socket, a socket some process serves -- is refused with QNCExistsEx, and left alone.
+void claimSocketPath(const std::string& acrPath, const sockaddr_un& acrAddress) {
+  struct stat lStatus;
+  if (lstat(acrPath.c_str(), &lStatus) != 0) {
+    if (errno == ENOENT) return;
+    throwSocketError("lstat", acrPath);
+  }
+  if (!S_ISSOCK(lStatus.st_mode)) refusePath(acrPath, "exists and is not a socket");
+  if (lStatus.st_uid != geteuid()) refusePath(acrPath, "is a socket of another user");
+  const int lProbe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (lProbe < 0) throwSocketError("socket", acrPath);
+  const int lResult = connect(lProbe, reinterpret_cast<const sockaddr*>(&acrAddress), sizeof acrAddress);
+  const int lErrno = errno;
+  close(lProbe);
+  if (lResult == 0) refusePath(acrPath, "is a socket that another process serves");
+  if (lErrno != ECONNREFUSED) {
+    errno = lErrno;
+    throwSocketError("connect", acrPath);
+  }
+  if (unlink(acrPath.c_str()) != 0 && errno != ENOENT) throwSocketError("unlink", acrPath);
+  QN_LOG_NOTICE("Removed the stale socket %s of an earlier run", acrPath.c_str());
 }
 }  // namespace
 
@@ -34,12 +73,28 @@ QNCSensorChannel::QNCSensorChannel(const std::string& acrPath)
   memcpy(lAddress.sun_path, acrPath.c_str(), acrPath.size() + 1);
   mListenFd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
   if (mListenFd < 0) throwSocketError("socket", acrPath);
-  unlink(acrPath.c_str());  // a socket file left by an earlier run; the instance lock says none runs
-  if (bind(mListenFd, reinterpret_cast<sockaddr*>(&lAddress), sizeof lAddress) != 0 || listen(mListenFd, 16) != 0) {
+  try {
+    claimSocketPath(acrPath, lAddress);
+  } catch (const QNCException&) {
+    close(mListenFd);
+    throw;
+  }
+  // The mode is set before listen(): until then every connect is refused, so no client can get in
+  // through the mode bind gave (0777 less the umask, which is 0 in a daemon).
+  const char* lpFailed = nullptr;
+  if (bind(mListenFd, reinterpret_cast<sockaddr*>(&lAddress), sizeof lAddress) != 0) {
+    lpFailed = "bind";
+  } else if (chmod(acrPath.c_str(), kSocketMode) != 0) {
+    lpFailed = "chmod";
+  } else if (listen(mListenFd, 16) != 0) {
+    lpFailed = "listen";
+  }
+  if (lpFailed != nullptr) {
     const int lErrno = errno;
     close(mListenFd);
+    if (strcmp(lpFailed, "bind") != 0) unlink(acrPath.c_str());
     errno = lErrno;
-    throwSocketError("bind", acrPath);
+    throwSocketError(lpFailed, acrPath);
   }
 }
 
@@ -67,14 +122,17 @@ bool QNCSensorChannel::waitForActivity(unsigned int aMilliseconds) {
     return false;
   }
   // A read wait: the body of a reading may trail its prefix by a moment.
-  QNCPointer<QNCFdReader> lNewReader(new (std::nothrow) QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
+  QNCPointer<QNCFdReader> lNewReader(new (std::nothrow)
+                                         QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
                                      QNPST_Individual, QNPAT_New);
-  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, 5000), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, 5000), QNPST_Individual,
+                                     QNPAT_New);
   QNCMutexLocker lGuard(mLock);
   mReader = lNewReader;
   mWriter = lNewWriter;
   mGeneration = mNextGeneration++;
-  QN_LOG_INFO("Channel %s: connection %lu accepted", mPath.c_str(), mGeneration);
+  if (QNPeerWarning(QNPW_Connection).admit())
+    QN_LOG_INFO("Channel %s: connection %lu accepted", mPath.c_str(), mGeneration);
   return false;
 }
 
@@ -112,7 +170,8 @@ void QNCSensorChannel::dropConnection() {
   {
     QNCMutexLocker lGuard(mLock);
     if (mReader.isNull()) return;
-    QN_LOG_INFO("Channel %s: connection %lu ended", mPath.c_str(), mGeneration);
+    if (QNPeerWarning(QNPW_Connection).admit())
+      QN_LOG_INFO("Channel %s: connection %lu ended", mPath.c_str(), mGeneration);
     // Moved out so the descriptors are closed after the lock is released.
     lReader = std::move(mReader);
     lWriter = std::move(mWriter);
@@ -128,5 +187,6 @@ unsigned long QNCSensorChannel::getGeneration() const {
 void QNCSensorChannelWriter::setGeneration(unsigned long aGeneration) { tlGeneration = aGeneration; }
 
 void QNCSensorChannelWriter::write(const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount) {
-  if (!mChannel.writeIfCurrent(tlGeneration, acrBuffer, arCount)) throw QNCWriteFailedEx("connection ended", EPIPE);
+  if (!mChannel.writeIfCurrent(tlGeneration, acrBuffer, arCount))
+    throw QNCWriteFailedEx("connection ended", EPIPE);
 }

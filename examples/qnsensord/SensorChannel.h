@@ -24,8 +24,16 @@
 
 class QNCSensorChannel {
  public:
-  // Binds and listens at acrPath, replacing a socket file left by an earlier run.
-  // Throws QNCOpenFailedEx naming the path when the socket cannot be set up.
+  // Owner read and write, group read and write: the service's group may feed readings, others
+  // may not even connect. Set explicitly, so the umask (0 in a daemon) plays no part.
+  static constexpr unsigned int kSocketMode = 0660;
+
+  // Binds a socket of mode kSocketMode at acrPath and listens. The caller must hold the instance
+  // lock (markAsRunning has run): a socket at acrPath owned by this user that nobody accepts on
+  // is then a leftover of an earlier run and is replaced. Throws QNCExistsEx, logged at error
+  // level, when anything else is at acrPath (a file, a directory, a link, another user's socket, a
+  // served socket): it is left untouched. Throws QNCOpenFailedEx naming the path and the call when
+  // the socket cannot be set up.
   explicit QNCSensorChannel(const std::string& acrPath);
   ~QNCSensorChannel();
   QNCSensorChannel(const QNCSensorChannel&) = delete;
@@ -43,7 +51,8 @@ class QNCSensorChannel {
 
   // Writes to the current connection if it is still generation acGeneration; returns false (and
   // writes nothing) when that connection has ended.
-  bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount);
+  bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer,
+                      unsigned int& arCount);
 
   // Ends the current connection (after the end of its stream, or a message that failed).
   void dropConnection();
@@ -66,7 +75,9 @@ class QNCSensorChannel {
 class QNCSensorChannelReader : public QNCReader {
  public:
   explicit QNCSensorChannelReader(QNCSensorChannel& arChannel) : mChannel(arChannel) {}
-  void read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) override { mChannel.read(arBuffer, arCount); }
+  void read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) override {
+    mChannel.read(arBuffer, arCount);
+  }
   bool waitForActivity(unsigned int acWaitTime) override { return mChannel.waitForActivity(acWaitTime); }
 
  private:

@@ -15,6 +15,7 @@
 #include "HeartbeatThread.h"
 #include "Logger.h"
 #include "MultiType.h"
+#include "PeerWarnings.h"
 #include "ProtocolHelper.h"
 #include "ReadingConsumer.h"
 #include "SensorChannel.h"
@@ -89,6 +90,7 @@ void QNCSensorSystem::createStartUpEvent() {
 
 void QNCSensorSystem::destroy() {
   QNCSystem::destroy();
+  QNFlushPeerWarnings();
   const auto lSnapshot = mStatistics.snapshot();
   QN_LOG_NOTICE("Statistics: %lu readings from %u sensors", mStatistics.total(),
                 static_cast<unsigned int>(lSnapshot.size()));
