@@ -11,6 +11,10 @@ command -v clang-format >/dev/null 2>&1 || missing+=(clang-format)
 [ -f /usr/include/gtest/gtest.h ] || missing+=(libgtest-dev)
 [ -f /usr/include/gmock/gmock.h ] || missing+=(libgmock-dev)
 [ -f /usr/include/benchmark/benchmark.h ] || missing+=(libbenchmark-dev)
+# The consumer tests and the Debian packages (tests/consumer/, scripts/package.sh).
+command -v pkg-config >/dev/null 2>&1 || missing+=(pkgconf)
+command -v readelf >/dev/null 2>&1 || missing+=(binutils)
+command -v dpkg-shlibdeps >/dev/null 2>&1 || missing+=(dpkg-dev)
 
 if [ ${#missing[@]} -gt 0 ]; then
   echo "Installing: ${missing[*]}"

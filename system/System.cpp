@@ -14,6 +14,7 @@
 #include "Reader.h"
 #include "SynchList.h"
 #include "SynchQueue.h"
+#include "SystemMember.h"
 #include "ThreadComponent.h"
 #include "ThreadPool.h"
 #include "Version.h"
@@ -32,6 +33,7 @@ QNCSystem::~QNCSystem() {
 QNCPointer<QNCIpAddress>& QNCSystem::getAddress() { return mAddress; }
 
 bool QNCSystem::isSetForExit() const {
+  QN_REQUIRE_MEMBER(mExitLock, QN_WHERE_EXIT_LOCK);
   mExitLock->lock();
   const bool lExitFlag = mExitFlag;
   mExitLock->unlock();
@@ -42,6 +44,7 @@ void QNCSystem::setAddress(const QNCPointer<QNCIpAddress>& acrAddress) { mAddres
 QNCString& QNCSystem::getHostName() { return mHostName; }
 
 void QNCSystem::setForExit() {
+  QN_REQUIRE_MEMBER(mExitLock, QN_WHERE_EXIT_LOCK);
   mExitLock->lock();
   mExitFlag = true;
   mExitLock->unlock();

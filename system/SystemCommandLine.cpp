@@ -11,6 +11,7 @@
 #include "MultiType.h"
 #include "QNException.h"
 #include "System.h"
+#include "SystemMember.h"
 #include "Version.h"
 
 namespace {
@@ -251,6 +252,7 @@ void QNCSystem::processDBReopenIntervalCommandLineArgument() {
 }
 
 void QNCSystem::displayVersionAndExit() {
+  QN_REQUIRE_MEMBER(mVersion, QN_WHERE_VERSION);
   printf("%s v%s", mName.get(), mVersion->getVersion());
   exit(0);
 }
