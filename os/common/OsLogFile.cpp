@@ -56,7 +56,7 @@ int OsOpenLogFile(const char* apPath, char* apReason, unsigned long aReasonSize)
   for (int lTry = 0; lTry < 3 && lFd < 0; ++lTry) {
     lFd = open(apPath, lFlags | O_CREAT | O_EXCL, kLogMode);
     if (lFd >= 0) {
-      // The umask may have taken bits away (077); the creation mode above is the floor under 0.
+      // open's mode passes through the umask (077 would leave 0600): set the log's mode exactly.
       (void)fchmod(lFd, kLogMode);  // the file stays usable with a narrower mode
       break;
     }
