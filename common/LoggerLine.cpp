@@ -1,12 +1,10 @@
 #include "LoggerLine.h"
 
-#include <pthread.h>
-#include <sys/syscall.h>
-#include <time.h>
-#include <unistd.h>
-
 #include <cstdio>
 #include <cstring>
+#include <ctime>
+
+#include "OsThread.h"
 
 namespace {
 
@@ -25,7 +23,7 @@ thread_local QNSLineCache gsLineCache;
 
 // A child of fork runs on in the forking thread under a new thread id: forget the cached one.
 void forgetThreadId() { gsLineCache.mTidLength = 0; }
-const int gsForkHook = pthread_atfork(nullptr, nullptr, forgetThreadId);
+const int gsForkHook = OsAtFork(nullptr, nullptr, forgetThreadId);
 
 // Appends up to the room left; returns the new write position.
 char* put(char* apOut, const char* apEnd, const char* apText, size_t aLength) {
@@ -36,7 +34,8 @@ char* put(char* apOut, const char* apEnd, const char* apText, size_t aLength) {
 }
 
 char* putText(char* apOut, const char* apEnd, const char* apText) {
-  return put(apOut, apEnd, apText != nullptr ? apText : "(null)", strlen(apText != nullptr ? apText : "(null)"));
+  return put(apOut, apEnd, apText != nullptr ? apText : "(null)",
+             strlen(apText != nullptr ? apText : "(null)"));
 }
 
 char* putUnsigned(char* apOut, const char* apEnd, unsigned long aValue, int aMinDigits) {
@@ -81,7 +80,7 @@ char* putTimeStamp(char* apOut, const char* apEnd) {
 char* putThreadId(char* apOut, const char* apEnd) {
   QNSLineCache& lrCache = gsLineCache;
   if (lrCache.mTidLength == 0) {
-    const int lLength = snprintf(lrCache.mTid, sizeof lrCache.mTid, "[%ld]", static_cast<long>(syscall(SYS_gettid)));
+    const int lLength = snprintf(lrCache.mTid, sizeof lrCache.mTid, "[%ld]", OsThreadId());
     lrCache.mTidLength = static_cast<size_t>(lLength);
   }
   return put(apOut, apEnd, lrCache.mTid, lrCache.mTidLength);
@@ -117,7 +116,8 @@ size_t QNFormatLogLine(char* apBuffer, size_t aCapacity, const char* apTag, unsi
     if (lWanted > 0) lpOut += static_cast<size_t>(lWanted) < lRoom ? static_cast<size_t>(lWanted) : lRoom - 1;
   }
   while (lpOut > lpMessage && lpOut[-1] == '\n') --lpOut;
-  for (char* lpScan = lpMessage; (lpScan = static_cast<char*>(memchr(lpScan, '\n', lpOut - lpScan))) != nullptr;)
+  for (char* lpScan = lpMessage;
+       (lpScan = static_cast<char*>(memchr(lpScan, '\n', lpOut - lpScan))) != nullptr;)
     *lpScan = ' ';
   *lpOut++ = '\n';
   return static_cast<size_t>(lpOut - apBuffer);
@@ -127,7 +127,8 @@ size_t QNFormatLogLineV(char* apBuffer, size_t aCapacity, const char* apTag, uns
                         const char* apFunction, const char* apFile, const char* apFormat, ...) {
   va_list lArgs;
   va_start(lArgs, apFormat);
-  const size_t lLength = QNFormatLogLine(apBuffer, aCapacity, apTag, aLine, apFunction, apFile, apFormat, lArgs);
+  const size_t lLength =
+      QNFormatLogLine(apBuffer, aCapacity, apTag, aLine, apFunction, apFile, apFormat, lArgs);
   va_end(lArgs);
   return lLength;
 }

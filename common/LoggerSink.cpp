@@ -1,45 +1,67 @@
 #include "LoggerSink.h"
 
-#include <errno.h>
-#include <fcntl.h>
-#include <signal.h>
-#include <time.h>
-#include <unistd.h>
-
 #include <chrono>
+#include <csignal>
 #include <cstdlib>
 #include <cstring>
 
+#include "Clib.h"
 #include "Logger.h"
 #include "LoggerLine.h"
+#include "OsLogFile.h"
+#include "OsSignal.h"
+#include "OsThread.h"
 
 namespace {
+
+constexpr int kStandardError = 2;
 
 // How long lines gather before the flusher writes them: well inside the promised second.
 constexpr auto kFlushDelay = std::chrono::milliseconds(200);
 
 bool isUrgent(unsigned int aLevel) { return (aLevel & (QNLL_Halt | QNLL_Error | QNLL_Warning)) != 0; }
 
-// Retries after EINTR and short writes. A failing log device drops the rest: there is nowhere
-// left to report it. Async-signal-safe.
+// A failing log device drops the rest: there is nowhere left to report it.
 void writeAll(int aFd, const char* apData, size_t aLength) {
-  while (aLength > 0) {
-    const ssize_t lWritten = ::write(aFd, apData, aLength);
-    if (lWritten < 0 && errno == EINTR) continue;
-    if (lWritten <= 0) return;
-    apData += lWritten;
-    aLength -= static_cast<size_t>(lWritten);
+  (void)OsWriteAllSignalSafe(aFd, apData, aLength);
+}
+
+// The syslog priority that sd-daemon(3) reads from a "<n>" prefix on a line of standard error.
+char priorityOf(unsigned int aLevel) {
+  switch (aLevel) {
+    case QNLL_Halt:
+      return '2';  // LOG_CRIT
+    case QNLL_Error:
+      return '3';  // LOG_ERR
+    case QNLL_Warning:
+      return '4';  // LOG_WARNING
+    case QNLL_Notice:
+      return '5';  // LOG_NOTICE
+    case QNLL_Trace:
+      return '7';  // LOG_DEBUG
+    default:
+      return '6';  // LOG_INFO
   }
 }
 
-// Spins on try_lock for at most about 50 ms; the crash handler must not wait for a lock that the
-// crashing thread itself may hold. pthread_mutex_trylock never blocks, and nanosleep is
-// async-signal-safe.
+// One write per line, so that the journal sees one record per line with its own priority.
+void writeToJournal(unsigned int aLevel, const char* apLine, size_t aLength) {
+  char lOut[3 + kQNLogMaxLine];
+  if (aLength > kQNLogMaxLine) aLength = kQNLogMaxLine;
+  lOut[0] = '<';
+  lOut[1] = priorityOf(aLevel);
+  lOut[2] = '>';
+  memcpy(lOut + 3, apLine, aLength);
+  writeAll(kStandardError, lOut, aLength + 3);
+}
+
+// Tries the lock for at most about 50 ms; the crash handler must not wait for a lock that the
+// crashing thread itself may hold. try_lock never blocks, and the 1 ms sleeps are clock_nanosleep,
+// which is async-signal-safe.
 bool lockWithin50Ms(std::mutex& arLock) {
-  for (int lTry = 0; lTry < 100; ++lTry) {
+  for (int lTry = 0; lTry < 50; ++lTry) {
     if (arLock.try_lock()) return true;
-    const struct timespec lPause = {0, 500 * 1000};
-    nanosleep(&lPause, nullptr);
+    ClibSleepMS(1);
   }
   return false;
 }
@@ -48,21 +70,12 @@ const int gsCrashSignals[] = {SIGSEGV, SIGBUS, SIGABRT, SIGFPE};
 
 void onCrashSignal(int aSignal) {
   QNCLogSink::instance().flushFromCrash();
-  // Default action, then the same signal again: it is blocked while this handler runs and is
-  // delivered on return, so the process dies of it (a fault that re-executes dies the same way).
-  struct sigaction lDefault = {};
-  lDefault.sa_handler = SIG_DFL;
-  sigemptyset(&lDefault.sa_mask);
-  sigaction(aSignal, &lDefault, nullptr);
-  raise(aSignal);
+  OsRaiseWithDefaultAction(aSignal);
 }
 
 void installCrashHandlers() {
-  struct sigaction lAction = {};
-  lAction.sa_handler = onCrashSignal;
-  sigemptyset(&lAction.sa_mask);
-  lAction.sa_flags = SA_ONSTACK;  // a thread with an alternate stack survives its stack overflow here
-  for (const int lSignal : gsCrashSignals) sigaction(lSignal, &lAction, nullptr);
+  // A handler that cannot be installed costs only the lines buffered at a crash.
+  for (const int lSignal : gsCrashSignals) (void)OsSetSignalHandler(lSignal, onCrashSignal);
 }
 
 }  // namespace
@@ -76,16 +89,19 @@ QNCLogSink& QNCLogSink::instance() {
 
 QNCLogSink::QNCLogSink() : mpSpare(mBatches[1]), mpActive(mBatches[0]) {
   // A fork must not find the locks held by a thread that does not exist in the child.
-  pthread_atfork(__forkPrepare, __forkParent, __forkChild);
+  (void)OsAtFork(__forkPrepare, __forkParent, __forkChild);  // fails only without memory at start-up
 }
 
 void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) {
   const bool lUrgent = isUrgent(aLevel);
+  const bool lJournal = mJournal.load(std::memory_order_relaxed);
+  if (lJournal) writeToJournal(aLevel, apLine, aLength);
   std::unique_lock<std::mutex> lGuard(mLock);
   if (mState != QNSS_Open) {
     if (mState == QNSS_Memory) mStartup.keep(aLevel, apLine, aLength);
-    // Under the lock, so that urgent lines of several threads reach standard error whole.
-    if (lUrgent) writeAll(STDERR_FILENO, apLine, aLength);
+    // Under the lock, so that urgent lines of several threads reach standard error whole. The
+    // journal copy above already took them there.
+    if (lUrgent && !lJournal) writeAll(kStandardError, apLine, aLength);
     return;
   }
   while (kBatch - mUsed < aLength) {
@@ -124,8 +140,8 @@ void QNCLogSink::_writeBatch() {
   if (lFd >= 0) writeAll(lFd, mpSpare, lLength);
 }
 
-bool QNCLogSink::open(const char* apPath, unsigned int aMask) {
-  const int lFd = ::open(apPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0640);
+bool QNCLogSink::open(const char* apPath, unsigned int aMask, char* apReason, size_t aReasonSize) {
+  const int lFd = OsOpenLogFile(apPath, apReason, aReasonSize);
   if (lFd < 0) return false;
   _writeBatch();  // what belongs to a log already open goes there
   {
@@ -134,18 +150,19 @@ bool QNCLogSink::open(const char* apPath, unsigned int aMask) {
     if (mState == QNSS_Open) {
       writeAll(mFd, mpActive, mUsed);  // lines that came between the write above and the locks
       mUsed = 0;
-      ::close(mFd);
+      OsCloseUnchecked(mFd);
     }
     mFd = lFd;
     mState = QNSS_Open;
+    mPath = apPath;
     const char* lpKept = nullptr;
     const size_t lKeptLength = mStartup.takeSelected(aMask, &lpKept);
     writeAll(mFd, lpKept, lKeptLength);
     if (mStartup.dropped() != 0 && (aMask & QNLL_Warning) != 0) {
       char lLine[kQNLogMaxLine];
-      const size_t lLength = QNFormatLogLineV(lLine, sizeof lLine, "-W-", __LINE__, __func__, __FILE__,
-                                              "%lu start-up lines did not fit in memory and are missing above",
-                                              mStartup.dropped());
+      const size_t lLength = QNFormatLogLineV(
+          lLine, sizeof lLine, "-W-", __LINE__, __func__, __FILE__,
+          "%lu start-up lines did not fit in memory and are missing above", mStartup.dropped());
       writeAll(mFd, lLine, lLength);
     }
     mStartup.release();
@@ -159,21 +176,34 @@ bool QNCLogSink::open(const char* apPath, unsigned int aMask) {
   return true;
 }
 
+bool QNCLogSink::reopen(char* apReason, size_t aReasonSize) {
+  // mWriteLock first: no batch is on its way to the old file while the descriptors change, and
+  // mState and mPath (written under both locks) can be read.
+  std::lock_guard<std::mutex> lWriteGuard(mWriteLock);
+  if (mState != QNSS_Open) return true;
+  const int lFd = OsOpenLogFile(mPath.c_str(), apReason, aReasonSize);
+  if (lFd < 0) return false;
+  std::lock_guard<std::mutex> lGuard(mLock);
+  writeAll(mFd, mpActive, mUsed);  // what was logged before the switch ends the old file
+  mUsed = 0;
+  OsCloseUnchecked(mFd);
+  mFd = lFd;
+  return true;
+}
+
 void QNCLogSink::close() {
-  pthread_t lFlusher{};
   bool lJoin = false;
   {
     std::lock_guard<std::mutex> lGuard(mLock);
     if (mState != QNSS_Open) return;
     if (mFlusherRunning) {
       mStopFlusher = true;
-      lFlusher = mFlusher;
       lJoin = true;
     }
   }
   if (lJoin) {
     mFlusherWake.notify_all();
-    pthread_join(lFlusher, nullptr);
+    mFlusher.join();
   }
   std::lock_guard<std::mutex> lWriteGuard(mWriteLock);
   std::lock_guard<std::mutex> lGuard(mLock);
@@ -181,7 +211,7 @@ void QNCLogSink::close() {
   mStopFlusher = false;
   writeAll(mFd, mpActive, mUsed);
   mUsed = 0;
-  ::close(mFd);
+  OsCloseUnchecked(mFd);
   mFd = -1;
   mState = QNSS_Closed;
 }
@@ -204,12 +234,12 @@ void QNCLogSink::_startFlusher() {
   if (mFlusherRunning || mState != QNSS_Open || mWriteThrough) return;
   // Without a flusher, lines still reach the file when a batch fills, at an urgent line and at
   // exit; only the one-second promise is lost, so a failed start is not worth failing a caller.
-  if (pthread_create(&mFlusher, nullptr, __flusherMain, this) == 0) mFlusherRunning = true;
-}
-
-void* QNCLogSink::__flusherMain(void* apSink) {
-  static_cast<QNCLogSink*>(apSink)->_runFlusher();
-  return nullptr;
+  try {
+    mFlusher = std::thread(&QNCLogSink::_runFlusher, this);
+    mFlusherRunning = true;
+  } catch (const std::system_error&) {
+    // Left without a flusher (see above).
+  }
 }
 
 void QNCLogSink::_runFlusher() {

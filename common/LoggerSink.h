@@ -10,14 +10,20 @@
 // with the spare one under mLock and writing the spare under mWriteLock, so writers keep appending
 // while a batch is on its way to the kernel. Lock order: mWriteLock, then mLock.
 //
+// Journal copy: while it is on, write() also sends each line to standard error with its priority
+// prefix, as one write(2) of at most kQNLogMaxLine + 3 bytes made outside the locks: pipes take
+// such a write whole (PIPE_BUF is 4096), and so does the journal's stream socket and a file, so
+// copies of concurrent lines never tear there either. While it is off the cost is one relaxed load.
+//
 // Any thread, at any time. write() blocks only for the copy, or for a batch write when the batch is
 // full or the line is urgent.
 
-#include <pthread.h>
-
+#include <atomic>
 #include <condition_variable>
 #include <cstddef>
 #include <mutex>
+#include <string>
+#include <thread>
 
 #include "LoggerStartupLines.h"
 
@@ -28,10 +34,20 @@ class QNCLogSink {
   // Takes one formatted line (newline included) of level aLevel.
   void write(unsigned int aLevel, const char* apLine, size_t aLength);
 
-  // Opens apPath for appending and makes it the log; writes the lines kept in memory whose level
-  // is in aMask at its head. Starts the flusher, installs the crash handlers and the exit handler.
-  // Returns false, leaving everything as it was, when the file cannot be opened (errno is set).
-  bool open(const char* apPath, unsigned int aMask);
+  // Opens apPath for appending (OsOpenLogFile) and makes it the log; writes the lines kept in
+  // memory whose level is in aMask at its head. Starts the flusher, installs the crash handlers and
+  // the exit handler. Returns false, leaving everything as it was, when the file cannot be opened
+  // or is refused; apReason (aReasonSize bytes) then says why.
+  bool open(const char* apPath, unsigned int aMask, char* apReason, size_t aReasonSize);
+
+  // Opens the log's path again and writes on there (the old file was moved away): the lines
+  // buffered so far go to the old file, every later one to the new file, none to both. Returns
+  // true when there is nothing to do (no log open). When the path cannot be opened, returns false
+  // with the reason and goes on writing to the old file. Blocks for one batch write and the open.
+  bool reopen(char* apReason, size_t aReasonSize);
+
+  // Turns the journal copy on or off; lines already written are not copied.
+  void setJournal(bool aOn) { mJournal.store(aOn, std::memory_order_relaxed); }
 
   // Writes out and closes the log; stops the flusher. Nothing happens when no log is open.
   void close();
@@ -52,16 +68,18 @@ class QNCLogSink {
   void _startFlusher();
   void _runFlusher();
   void _atExit();
-  static void* __flusherMain(void* apSink);
   static void __onExit();
   static void __forkPrepare();
   static void __forkParent();
   static void __forkChild();
 
-  std::mutex mWriteLock;  // guards mpSpare and the order of batch writes to mFd
-  char* mpSpare;
+  std::atomic<bool> mJournal{false};
 
-  std::mutex mLock;  // guards every member below
+  std::mutex mWriteLock;  // guards mpSpare, mPath and the order of batch writes to mFd
+  char* mpSpare;
+  std::string mPath;  // of the open log; written under both locks
+
+  std::mutex mLock;  // guards every member below; mState and mFd are written under both locks
   QNESinkState mState = QNSS_Memory;
   int mFd = -1;
   char* mpActive;
@@ -69,7 +87,9 @@ class QNCLogSink {
   bool mWriteThrough = false;    // after the exit handler, in a child of fork: lines written at once
   bool mFlusherRunning = false;  // a flusher thread exists in this process
   bool mStopFlusher = false;
-  pthread_t mFlusher{};
+  // Joinable only while mFlusherRunning in the process that started it: a child of fork inherits
+  // the object but not the thread, and neither joins nor replaces it (it never starts a flusher).
+  std::thread mFlusher;
   std::condition_variable mFlusherWake;  // a first line in an empty batch, or a stop request
   QNCLogStartupLines mStartup;
   char mBatches[2][kBatch];

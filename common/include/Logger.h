@@ -28,10 +28,30 @@
 // - Before CreateLogger, lines are kept in memory (at most 1 MiB; lines beyond are counted and
 //   the count is logged at the head of the log); CreateLogger writes at the head of the log those
 //   whose level the mask then in force selects. "-H-", "-E-" and "-W-" lines also go to standard
-//   error at once, so a failed start-up is visible before the log exists; no other line ever
-//   reaches standard error. After destroyLogger only those levels reach standard error.
-// - A log path that cannot be opened is reported on standard error; the process goes on and the
-//   logger stays as it was (still keeping lines in memory, or still writing the log already open).
+//   error at once, so a failed start-up is visible before the log exists; no other line reaches
+//   standard error unless the journal copy is on (below). After destroyLogger only those levels
+//   reach standard error.
+// - Journal copy: when CreateLogger finds standard error to be systemd's journal (JOURNAL_STREAM
+//   names its device and inode) or QN_LOG_STDERR=1 is set, every line written from then until
+//   destroyLogger also goes to standard error, one write per line, behind the priority prefix of
+//   sd-daemon(3): "<2>" -H-, "<3>" -E-, "<4>" -W-, "<5>" -N-, "<6>" -I-, "<7>" -T-. The log file
+//   is written as without it, and the plain copies of urgent lines are not made twice. Lines logged
+//   before CreateLogger reach the journal only as those plain copies. The choice is made at each
+//   CreateLogger; with the copy off, a line costs no system call and no lock more.
+// - Rotation: CreateLogger registers SIGUSR1 through RegisterSignalHandler (logrotate's
+//   postrotate sends it). The handler only writes to the dispatcher's pipe; the dispatcher thread
+//   then reopens the log at its path under the logger's write lock: every line lands whole in
+//   exactly one of the moved and the new file, none is lost. When the path cannot be opened again
+//   the logger writes on to the moved file and says so in an "-E-" line. SIGINT, SIGTERM and
+//   SIGHUP are left as they are. An application that wants SIGUSR1 for itself registers its own
+//   function after CreateLogger.
+// - Opening is safe under a shared directory such as /tmp: a symbolic link at the last component
+//   of the path is not followed, and only a regular file owned by the effective user is used. A
+//   log file CreateLogger creates gets mode 0640 whatever the umask (a daemon runs with umask 0);
+//   an existing file keeps its mode.
+// - A log path that cannot be opened or is refused is reported on standard error with the reason;
+//   the process goes on and the logger stays as it was (still keeping lines in memory, or still
+//   writing the log already open).
 // - No thread of its own exists before CreateLogger, so a fork before it (daemonizing) loses
 //   nothing; the memory of the lines kept so far is inherited by the child. A child forked after
 //   CreateLogger drops the parent's unwritten lines (the parent writes them) and appends its own
@@ -65,14 +85,16 @@ void PrintLogMessageWithTimeStamp(unsigned int aLevel, const char* apTag, unsign
                                   const char* apFunction, const char* apFile, const char* apFormat, ...)
     __attribute__((format(printf, 6, 7)));
 
-// Opens the log at acrPath for appending (created with mode 0640 if missing) and writes the
-// lines kept since start-up. A second call writes out and closes the first log and opens the new
-// path. Never throws; a path that cannot be opened is reported on standard error. Call it from
-// one thread at a time (start-up does).
+// Opens the log at acrPath for appending (created with mode 0640 if missing; a symbolic link,
+// a file of another user and a file that is not regular are refused) and writes the lines kept
+// since start-up. Decides the journal copy and registers SIGUSR1 for reopening (see above). A
+// second call writes out and closes the first log and opens the new path. Never throws; a path
+// that cannot be opened is reported on standard error. Call it from one thread at a time (start-up
+// does).
 void CreateLogger(const QNCString& acrPath);
 
-// Writes out and closes the log and stops the flusher thread. Later lines of "-H-", "-E-" and
-// "-W-" go to standard error only. Blocks until the flusher has ended.
+// Writes out and closes the log, stops the flusher thread and ends the journal copy. Later lines
+// of "-H-", "-E-" and "-W-" go to standard error only (without a prefix). Blocks until the flusher has ended.
 void destroyLogger();
 
 // Writes out every buffered line now. Blocks until the bytes are handed to the kernel.
@@ -86,9 +108,9 @@ void getLogCode(unsigned int& arMask);
 void setHbTimeout(unsigned int aValue);
 void getHbTimeout(unsigned int& arValue);
 
-#define QN_LOG(level, tag, ...)                                                         \
-  do {                                                                                 \
-    if (QNIsLogLevelOn(level))                                                         \
+#define QN_LOG(level, tag, ...)                                                            \
+  do {                                                                                     \
+    if (QNIsLogLevelOn(level))                                                             \
       PrintLogMessageWithTimeStamp(level, tag, __LINE__, __func__, __FILE__, __VA_ARGS__); \
   } while (0)
 

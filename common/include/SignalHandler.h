@@ -18,6 +18,9 @@
 // takes its default action there (and never runs the parent's function in the parent). The
 // child's own first registration starts the child's dispatcher.
 //
+// The logger registers SIGUSR1 at CreateLogger to reopen its file (Logger.h); an application that
+// wants SIGUSR1 for itself registers after CreateLogger.
+//
 // Throws QNCInvalidEx for a number that is not a signal, and QNCOsException when the pipe, the
 // thread or sigaction cannot be set up (the previous function then stays registered).
 // Any thread; registrations are serialised.
