@@ -10,6 +10,7 @@
 #include "LoggerLine.h"
 #include "OsLogFile.h"
 #include "OsSignal.h"
+#include "OsStream.h"
 #include "OsThread.h"
 
 namespace {
@@ -23,7 +24,8 @@ bool isUrgent(unsigned int aLevel) { return (aLevel & (QNLL_Halt | QNLL_Error | 
 
 // A failing log device drops the rest: there is nowhere left to report it.
 void writeAll(int aFd, const char* apData, size_t aLength) {
-  (void)OsWriteAllSignalSafe(aFd, apData, aLength);
+  unsigned long lWritten = 0;
+  (void)OsWriteFully(aFd, apData, aLength, QNPS_Raise, lWritten);
 }
 
 // The syslog priority that sd-daemon(3) reads from a "<n>" prefix on a line of standard error.
@@ -150,7 +152,7 @@ bool QNCLogSink::open(const char* apPath, unsigned int aMask, char* apReason, si
     if (mState == QNSS_Open) {
       writeAll(mFd, mpActive, mUsed);  // lines that came between the write above and the locks
       mUsed = 0;
-      OsCloseUnchecked(mFd);
+      ClibCloseQuietly(mFd);
     }
     mFd = lFd;
     mState = QNSS_Open;
@@ -186,7 +188,7 @@ bool QNCLogSink::reopen(char* apReason, size_t aReasonSize) {
   std::lock_guard<std::mutex> lGuard(mLock);
   writeAll(mFd, mpActive, mUsed);  // what was logged before the switch ends the old file
   mUsed = 0;
-  OsCloseUnchecked(mFd);
+  ClibCloseQuietly(mFd);
   mFd = lFd;
   return true;
 }
@@ -211,7 +213,7 @@ void QNCLogSink::close() {
   mStopFlusher = false;
   writeAll(mFd, mpActive, mUsed);
   mUsed = 0;
-  OsCloseUnchecked(mFd);
+  ClibCloseQuietly(mFd);
   mFd = -1;
   mState = QNSS_Closed;
 }

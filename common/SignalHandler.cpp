@@ -10,7 +10,6 @@
 #include "Clib.h"
 #include "Logger.h"
 #include "OsError.h"
-#include "OsLogFile.h"
 #include "OsSignal.h"
 #include "OsStream.h"
 #include "OsThread.h"
@@ -40,7 +39,8 @@ void onSignal(int aSignal) {
     OsRaiseWithDefaultAction(aSignal);
   } else {
     const unsigned char lSignal = static_cast<unsigned char>(aSignal);
-    (void)OsWriteAllSignalSafe(gsSignalWriteFd.load(), &lSignal, 1);  // a full pipe drops it (above)
+    unsigned long lWritten = 0;  // a full pipe drops it (above)
+    (void)OsWriteFully(gsSignalWriteFd.load(), &lSignal, 1, QNPS_Raise, lWritten);
   }
   errno = lSavedErrno;
 }
@@ -89,8 +89,8 @@ void startDispatcher() {
     std::thread(dispatchSignals, lPipe[0], std::move(lStarted)).detach();
     lRunning.wait();
   } catch (const std::system_error& acrError) {
-    OsCloseUnchecked(lPipe[0]);
-    OsCloseUnchecked(lPipe[1]);
+    ClibCloseQuietly(lPipe[0]);
+    ClibCloseQuietly(lPipe[1]);
     OsThrowError<QNCOsException>(acrError.code().value(), "std::thread (signal dispatcher)");
   }
   // The parent's pipe, inherited by a child, stays open there: its read end may be in use by

@@ -77,20 +77,6 @@ int OsOpenLogFile(const char* apPath, char* apReason, unsigned long aReasonSize)
   return lFd;
 }
 
-bool OsWriteAllSignalSafe(int aFd, const void* apData, unsigned long aCount) noexcept {
-  const char* lpBytes = static_cast<const char*>(apData);
-  while (aCount > 0) {
-    const ssize_t lWritten = write(aFd, lpBytes, aCount);
-    if (lWritten < 0 && errno == EINTR) continue;  // interrupted before any byte went out
-    if (lWritten <= 0) return false;
-    lpBytes += lWritten;
-    aCount -= static_cast<unsigned long>(lWritten);
-  }
-  return true;
-}
-
-void OsCloseUnchecked(int aFd) noexcept { (void)close(aFd); }
-
 bool OsIsJournalStream(int aFd, const char* apJournalStream) noexcept {
   if (apJournalStream == nullptr) return false;
   char* lpEnd = nullptr;

@@ -1,6 +1,7 @@
 #pragma once
-// The system calls behind the log: opening the log file safely, writing whole lines from any
-// context, and recognising systemd's journal on a descriptor.
+// The system calls behind the log: opening the log file safely and recognising systemd's journal
+// on a descriptor. Whole lines are written with OsWriteFully (OsStream.h), closed with
+// ClibCloseQuietly (Clib.h).
 //
 // Every function may be called from any thread; none keeps state of its own. None throws: the log
 // is where failures are reported, so its own failures come back as results.
@@ -17,15 +18,6 @@
 //   the log carries host data and what peers sent). An existing file keeps its mode, as logrotate's
 //   "create" set it.
 int OsOpenLogFile(const char* apPath, char* apReason, unsigned long aReasonSize) noexcept;
-
-// Async-signal-safe. Writes all aCount bytes, continuing after partial writes and EINTR. Returns
-// false when the descriptor fails or would block (a full non-blocking pipe): the rest is dropped,
-// as a log device that fails leaves nowhere to report it.
-bool OsWriteAllSignalSafe(int aFd, const void* apData, unsigned long aCount) noexcept;
-
-// close(2), its result ignored: for a descriptor that is given up either way. Never repeated after
-// EINTR (Linux has already released the descriptor).
-void OsCloseUnchecked(int aFd) noexcept;
 
 // True when aFd is the stream that systemd describes in JOURNAL_STREAM: apJournalStream (the
 // variable's value, or null) reads "<device>:<inode>" and equals fstat's st_dev and st_ino of aFd.
