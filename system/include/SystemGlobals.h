@@ -64,5 +64,6 @@ void SystemMain(int argc, char** argv);
 //    confirmed: ..." (the daemon is left running). A successful start prints nothing.
 //  - In the intermediate process of daemonizing, after "-s", and wherever systemDaemonize did not
 //    run under SystemMain: 0 at once.
-// Standard error, moved aside in the parents while they left start-up, is restored first.
+// Standard error, moved aside in the parents while they left start-up (so that their halt lines
+// stay off the terminal), is put back first; a parent that never calls this keeps it on /dev/null.
 int waitForDaemonStart();
