@@ -3,6 +3,10 @@
 // Unlike the rest of system/, this file makes a few POSIX calls itself (umask, getrlimit, fork,
 // setsid, sigemptyset, sigaction, close): they change the calling process in ways the service
 // layer has no wrapper for.
+//
+// When SystemMain runs it, the daemon keeps one descriptor pair open through "close every
+// descriptor": the channel on which it tells the starting command how start-up ended
+// (DaemonStart.h). While start-up runs its descriptor 2 is that channel; afterwards acStdErr.
 
 #include <fcntl.h>
 #include <signal.h>
@@ -10,8 +14,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <utility>
+
 #include "Assert.h"
 #include "Clib.h"
+#include "DaemonStart.h"
 #include "Logger.h"
 #include "QNException.h"
 #include "System.h"
@@ -23,29 +30,43 @@ constexpr int kRedirectFlags = O_WRONLY | O_CREAT | O_APPEND;
 constexpr int kRedirectMode = 0600;
 constexpr unsigned int kExitCheckStep = 5;
 
-// Closes descriptors 0 .. aLimit - 1 (and any above, which can exist when the limit was lowered
-// after they were opened). Results are ignored: most of these descriptors are not open.
+// Closes aFirst .. aLast, or up to aLimit - 1 when close_range() is refused.
 // The hard limit can be a million or more in containers, where a close() per descriptor takes
-// noticeable time, so everything from 3 up goes in one close_range() call; a kernel or sandbox
-// that refuses it gets the plain loop.
-void closeAllDescriptors(rlim_t aLimit) {
+// noticeable time, so a span goes in one close_range() call; a kernel or sandbox that refuses it
+// gets the plain loop. Results are ignored: most of these descriptors are not open.
+void closeSpan(unsigned int aFirst, unsigned int aLast, rlim_t aLimit) {
+  if (aFirst > aLast) return;
+#if defined(__GLIBC__) && (__GLIBC__ > 2 || (__GLIBC__ == 2 && __GLIBC_MINOR__ >= 34))
+  if (close_range(aFirst, aLast, 0) == 0) return;
+#endif
+  for (rlim_t lFd = aFirst; lFd <= aLast && lFd < aLimit; ++lFd) close(static_cast<int>(lFd));
+}
+
+// Closes descriptors 0 .. aLimit - 1 (and any above, which can exist when the limit was lowered
+// after they were opened), except the daemon's start channel (DaemonStart.h): aKeepLow and
+// aKeepHigh, -1 when there is none, else at least 3 and aKeepLow < aKeepHigh.
+void closeAllDescriptors(rlim_t aLimit, int aKeepLow, int aKeepHigh) {
   for (int lFd = 0; lFd < 3 && static_cast<rlim_t>(lFd) < aLimit; ++lFd) close(lFd);
   if (aLimit <= 3) return;
-#if defined(__GLIBC__) && (__GLIBC__ > 2 || (__GLIBC__ == 2 && __GLIBC_MINOR__ >= 34))
-  if (close_range(3, ~0U, 0) == 0) return;
-#endif
-  for (rlim_t lFd = 3; lFd < aLimit; ++lFd) close(static_cast<int>(lFd));
+  unsigned int lFirst = 3;
+  for (const int lKeep : {aKeepLow, aKeepHigh}) {
+    if (lKeep < 0) continue;
+    closeSpan(lFirst, static_cast<unsigned int>(lKeep) - 1, aLimit);
+    lFirst = static_cast<unsigned int>(lKeep) + 1;
+  }
+  closeSpan(lFirst, ~0U, aLimit);
 }
 
 // The parent's side of a fork: it leaves start-up by this exception, the child goes on.
-[[noreturn]] void leaveAsParent() {
+[[noreturn]] void leaveAsParent(bool aStarting) {
+  QNCDaemonStart::enterParent(aStarting);  // before the halt line: a start that succeeds is quiet
   QN_LOG_HALT("Time for parent process to quit");
   QN_LEFT();
   throw QNCParentExitEx("Time for parent process to quit", 19);
 }
 
 // fork() with the failure and parent handling both forks share; returns only in the child.
-void forkAndLeaveParent(char* apErrorText) {
+void forkAndLeaveParent(char* apErrorText, bool aStarting) {
   QN_LOG_TRACE("Going to fork ");
   const pid_t lPid = fork();
   if (lPid < 0) {
@@ -54,7 +75,7 @@ void forkAndLeaveParent(char* apErrorText) {
     QN_LEFT();
     throw QNCProcessCreationFailedEx(apErrorText, 345);
   }
-  if (lPid > 0) leaveAsParent();
+  if (lPid > 0) leaveAsParent(aStarting);
 }
 }  // namespace
 
@@ -72,7 +93,9 @@ void QNCSystem::systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString ac
     throw QNCExitConditionEx(lErrorText, 19);
   }
 
-  forkAndLeaveParent(lErrorText);
+  // Before the first fork, so that the starting command holds its end (SystemMain arms it).
+  QNCDaemonStart::openChannel();
+  forkAndLeaveParent(lErrorText, true);
 
   QN_LOG_INFO("Creating a new session for the process and making it session leader");
   setsid();  // cannot fail here: the child of a fork is never a process group leader
@@ -91,14 +114,18 @@ void QNCSystem::systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString ac
 
   // The session leader stays behind as the parent, so the daemon can never again acquire a
   // controlling terminal by opening one.
-  forkAndLeaveParent(lErrorText);
+  forkAndLeaveParent(lErrorText, false);
 
   QN_ASSERT(acDir.isEmpty() == false);
   ClibChdir(acDir.get());
 
   const rlim_t lDescriptorLimit = lLimit.rlim_max == RLIM_INFINITY ? kUnlimitedDescriptors : lLimit.rlim_max;
   QN_LOG_TRACE("Closing all the file descriptors");
-  closeAllDescriptors(lDescriptorLimit);
+  int lKeepLow = -1;
+  int lKeepHigh = -1;
+  QNCDaemonStart::getKeptDescriptors(lKeepLow, lKeepHigh);
+  if (lKeepLow > lKeepHigh) std::swap(lKeepLow, lKeepHigh);
+  closeAllDescriptors(lDescriptorLimit, lKeepLow, lKeepHigh);
 
   // With every descriptor closed, open() hands out the lowest free numbers: 0, 1 and 2.
   int lStdIn = -1;
@@ -115,6 +142,7 @@ void QNCSystem::systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString ac
     ClibStrerror(lErrorText, sizeof lErrorText);
     throw QNCExitConditionEx(lErrorText, 19);
   }
+  QNCDaemonStart::enterDaemon();
   QN_LEFT();
 }
 

@@ -6,9 +6,12 @@
 
 #include "Assert.h"
 #include "Clib.h"
+#include "DaemonStart.h"
 #include "Logger.h"
+#include "OsService.h"
 #include "QNException.h"
 #include "QNString.h"
+#include "ServiceNotifier.h"
 #include "SignalHandler.h"
 #include "System.h"
 
@@ -27,7 +30,20 @@ char gsLogFilePath[512] = {0};
 void requestExit() {
   std::lock_guard<std::mutex> lGuard(gsExitRequestLock);
   QNCSystem* lpSystem = gspSystem.load();
-  if (lpSystem != nullptr) lpSystem->makeThreadsToExit();
+  if (lpSystem == nullptr) return;
+  QNCServiceNotifier::instance().notifyStopping();
+  lpSystem->makeThreadsToExit();
+}
+
+// Logs the tolerated "no configuration file" line at its error level, to the log only: it is not
+// a failure, and on the terminal of a start that succeeds it would read as one. Descriptor 2 is
+// moved aside for the one call (start-up runs on the main thread alone at this point).
+void logConfigFileNotImplemented() {
+  const int lStderr = OsCopyDescriptor(2);
+  const bool lMoved = lStderr >= 0 && OsNullDescriptor(2);
+  QN_LOG_ERROR("Config file parsing not implemented.");
+  if (lMoved) OsReplaceDescriptor(lStderr, 2);
+  OsCloseDescriptor(lStderr);
 }
 
 void handleSigInt(int) { requestExit(); }
@@ -73,7 +89,7 @@ void SysInit(int argc, char** argv) {
   try {
     lpSystem->parseConfigFile(lConfFilePath);
   } catch (QNCNotImplementedEx&) {
-    QN_LOG_ERROR("Config file parsing not implemented.");
+    logConfigFileNotImplemented();
   }
   lpSystem->applySettings();
   getLogFilePath(lLogFilePath);
@@ -99,6 +115,9 @@ void SysExit() {
   QNCSystem* const lpSystem = gspSystem.load();
   QN_LOG_TRACE("Waiting for threads to exit...");
   lpSystem->waitForThreads();
+  QNCServiceNotifier& lrNotifier = QNCServiceNotifier::instance();
+  lrNotifier.stopWatchdog();
+  lrNotifier.notifyStopping();  // once only: the signal that asked for the exit may have sent it
   QN_LOG_INFO("All threads have gracefully exited");
   QN_LOG_TRACE("Going to unmark itself as singleton running process");
   lpSystem->exitInstanceManagement();
@@ -110,6 +129,7 @@ void SysExit() {
     gspSystem.store(nullptr);
   }
   delete lpSystem;
+  lrNotifier.send("STATUS=Stopped");
   QN_LOG_INFO("Destroying the Logger. You won't see any more logs!");
   destroyLogger();
   QN_LEFT();
@@ -118,7 +138,23 @@ void SysExit() {
 void SystemMain(int argc, char** argv) {
   QN_ENTERED();
   setLogCode(255);
-  SysInit(argc, argv);
+  QNCServiceNotifier& lrNotifier = QNCServiceNotifier::instance();
+  lrNotifier.send("STATUS=Starting");
+  QNCDaemonStart::arm();
+  try {
+    SysInit(argc, argv);
+  } catch (...) {
+    // The daemon tells its starting command why (nothing happens in any other process), and the
+    // exception goes on unchanged.
+    QNCDaemonStart::reportFailure(QNCurrentExceptionText());
+    throw;
+  }
+  // READY=1 first: whoever hears that the starting command ended can count on it being sent.
+  lrNotifier.send("READY=1\nSTATUS=Running");
+  QNCDaemonStart::reportReady();
+  QNCSystem* lpSystem = nullptr;
+  getSystemObject(lpSystem);
+  lrNotifier.startWatchdog(lpSystem);
   SysExit();
   QN_LEFT();
 }

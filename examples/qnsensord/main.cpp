@@ -12,8 +12,9 @@ int main(int argc, char** argv) {
     setLogFilePath("qnsensord.log");
     SystemMain(argc, argv);
   } catch (const QNCParentExitEx&) {
-    // The parent side of daemonizing, or "-s" after stopping the running instance.
-    return 0;
+    // The parent side of daemonizing (0 only once the daemon runs; its reason on standard error
+    // otherwise), or "-s" after stopping the running instance.
+    return waitForDaemonStart();
   } catch (const QNCUsageEx& acrException) {
     // Refused during the command-line step: no log file, no PID file, no thread exists yet.
     fprintf(stderr, "qnsensord: %s\n", acrException.what());

@@ -3,9 +3,14 @@
 // the one system object the application registers.
 //
 //   int main(int argc, char** argv) {
-//     setSystemObject(new MySystem);      // the driver owns it from now on
-//     setLogFilePath("myservice.log");    // $QN_LOG_DIR/myservice.log, else /tmp/myservice.log
-//     SystemMain(argc, argv);             // returns after an orderly shut-down
+//     try {
+//       setSystemObject(new MySystem);    // the driver owns it from now on
+//       setLogFilePath("myservice.log");  // $QN_LOG_DIR/myservice.log, else /tmp/myservice.log
+//       SystemMain(argc, argv);           // returns after an orderly shut-down
+//     } catch (const QNCParentExitEx&) {
+//       return waitForDaemonStart();      // 0 once the daemon runs; 1 and its reason otherwise
+//     }
+//     return 0;
 //   }
 //
 // SystemMain enables every log level, runs SysInit (the lifecycle operations of QNCSystem in
@@ -39,4 +44,26 @@ void getLogDir(QNCString& arDir);
 
 void SysInit(int argc, char** argv);
 void SysExit();
+// Besides the above, SystemMain
+//  - tells the command that started a daemon how the daemon's start-up ended (waitForDaemonStart),
+//    catching whatever SysInit throws in the daemon only to report it, and throwing it on
+//    unchanged;
+//  - speaks the systemd notification protocol when NOTIFY_SOCKET is set: STATUS lines, READY=1
+//    once SysInit has returned, STOPPING=1 at the exit request, and WATCHDOG=1 pings when
+//    WATCHDOG_USEC asks for them (ServiceNotifier.h says when the process counts as healthy).
+// The tolerated "Config file parsing not implemented." line goes to the log only, never to the
+// terminal: it is not a failure.
 void SystemMain(int argc, char** argv);
+
+// For the application's catch of QNCParentExitEx; returns the exit status of that process.
+//  - In the command that started a daemon: waits until the daemon holds its PID file and SysInit
+//    has returned in it (0), or until it reports the exception that ended its start-up, or ends
+//    without a word (1, after printing on standard error the daemon's error and warning lines of
+//    before its log was open, then "Daemon start-up failed: <reason>"). The wait is bounded:
+//    QN_START_TIMEOUT seconds (1 to 3600), 30 when unset; after it, 1 and "Daemon start-up not
+//    confirmed: ..." (the daemon is left running). A successful start prints nothing.
+//  - In the intermediate process of daemonizing, after "-s", and wherever systemDaemonize did not
+//    run under SystemMain: 0 at once.
+// Standard error, moved aside in the parents while they left start-up (so that their halt lines
+// stay off the terminal), is put back first; a parent that never calls this keeps it on /dev/null.
+int waitForDaemonStart();
