@@ -270,23 +270,6 @@ class SettingsTest : public ::testing::Test {
   unsigned int mSavedLogCode = 0, mSavedHbTimeout = 0;
 };
 
-// The store hands out the stored value itself; a second value for a key is refused and the first
-// stays; a missing key leaves the caller's pointer alone.
-TEST_F(SettingsTest, SettingsAreSharedByReferenceAndKeyedOnce) {
-  QNCPointer<QNCMultiType> lOriginal(new (std::nothrow) QNCMultiType(15u)), lFound;
-  mSystem.addSetting("DBReopenInterval", lOriginal);
-  mSystem.getSetting("DBReopenInterval", lFound);
-  EXPECT_EQ(lOriginal.get(), lFound.get());
-  EXPECT_EQ("Element already exists in map.. can't insert", qntest::thrown<QNCExistsEx>([&] {
-              mSystem.add("DBReopenInterval", new (std::nothrow) QNCMultiType(5u));
-            }));
-  mSystem.getSetting("DBReopenInterval", lFound);
-  EXPECT_EQ(lOriginal.get(), lFound.get());
-  EXPECT_EQ("No element for the key exists in map",
-            qntest::thrown<QNCNotFoundEx>([&] { mSystem.getSetting("ConfigFile", lFound); }));
-  EXPECT_EQ(lOriginal.get(), lFound.get());
-}
-
 TEST_F(SettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
   mSystem.addAll(new QNCMultiType(121u), new QNCMultiType(45u),
                  new QNCMultiType(static_cast<signed char>(1)));
