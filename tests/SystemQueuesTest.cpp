@@ -42,6 +42,8 @@ const Container kList{"List",
                       [](QNCSystem& arS, unsigned int aN) { arS.listClear(aN); },
                       [](QNCSystem& arS, unsigned int aN) { return arS.isListEmpty(aN); }};
 
+void PrintTo(const Container& acrContainer, std::ostream* apStream) { *apStream << acrContainer.mName; }
+
 class SystemContainerTest : public ::testing::TestWithParam<Container> {
  protected:
   void put(unsigned int aNumber, const Element& acrElement) { GetParam().mPut(mSystem, aNumber, acrElement); }
@@ -281,7 +283,7 @@ TEST_P(SystemContainerTest, HandOffUnderStressDeliversEveryItemExactlyOnce) {
   // A lost wake-up leaves a consumer asleep beside a non-empty container: report it, then rescue.
   EXPECT_TRUE(qntest::eventually([&] { return lConsumersDone.load() == kConsumers; }, 60s));
   while (lConsumersDone.load() != kConsumers) {
-    mSystem.signal(0);
+    lPut(-1);  // the stop markers may be what was lost
     std::this_thread::sleep_for(1ms);
   }
   for (auto& lThread : lThreads) lThread.join();
