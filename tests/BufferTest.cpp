@@ -136,18 +136,6 @@ TEST_F(BufferManagerTest, NoFittingBucketThrowsFromGetButOnlyLogsFromReuse) {
             qntest::levelOf(log(), "Failed to determine bucket no, error: Cannot find a buffer bucket"));
 }
 
-TEST_F(BufferManagerTest, DestructionReportsTheUsedLengthsOfIdleBuffers) {
-  auto lManager = makeManager({64, 256});
-  QNCPointer<QNCBuffer> lA = take(*lManager, 10), lB = take(*lManager, 20);
-  QNCPointer<QNCBuffer> lOut = take(*lManager, 200);  // handed out, not idle: not counted
-  lManager->reuse(lA);
-  lManager->reuse(lB);
-  lManager.reset();
-  qntest::expectInOrder(log(), {"Memory Used by the memory slab 64 : 30\n",
-                                "Memory Used by the memory slab 256 : 0\n", "TOTAL Memory Used : 30\n"});
-  EXPECT_EQ(10u, lA->getLength());  // the pool dropped its references; the caller's survive
-}
-
 // Threads take and return buffers of every bucket, also lowering the used length so buffers
 // move between buckets. A buffer handed to two threads at once, or lost, must show.
 TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
