@@ -273,11 +273,12 @@ TEST(MutexTest, LockerReleasesOnExceptionAndDestroyingALockedMutexIsSwallowed) {
 #if !defined(__SANITIZE_THREAD__)  // ThreadSanitizer reports exactly what this provokes
   alignas(QNCMutex) unsigned char lStorage[sizeof(QNCMutex)];
   QNCMutex* lpMutex = new (lStorage) QNCMutex();
+  pthread_mutex_t* lpSystemMutex = &lpMutex->getMutex();
   lpMutex->lock();
   EXPECT_NO_THROW(lpMutex->~QNCMutex());
   // The failed destroy left the system mutex as it was: still valid and locked.
-  EXPECT_EQ(0, pthread_mutex_unlock(&lpMutex->getMutex()));
-  EXPECT_EQ(0, pthread_mutex_destroy(&lpMutex->getMutex()));
+  EXPECT_EQ(0, pthread_mutex_unlock(lpSystemMutex));
+  EXPECT_EQ(0, pthread_mutex_destroy(lpSystemMutex));
 #endif
 }
 
