@@ -230,8 +230,12 @@ TEST_F(SystemWaitTest, NonEmptyListReturnsAtOnceAndAFailedTestReleasesTheConditi
   EXPECT_TRUE(qntest::returnsWithin([&] { mSystem.waitOnEmptyList(0, 0); }, 10s, [&] { mSystem.signal(0); }));
   mQueue->mFailTest = true;
   EXPECT_THROW(mSystem.waitOnEmptyQueue(0, 0), QNCOsException);
-  EXPECT_TRUE(qntest::returnsWithin([&] { mSystem.conditional(0).lock(); }, 10s));
-  mSystem.conditional(0).unlock();
+  EXPECT_TRUE(qntest::returnsWithin(
+      [&] {
+        mSystem.conditional(0).lock();
+        mSystem.conditional(0).unlock();
+      },
+      10s));
 }
 
 // Many producers and consumers on one queue (or list) and one conditional: every item arrives
