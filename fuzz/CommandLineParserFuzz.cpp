@@ -121,11 +121,6 @@ void checkParsed(QNCCommandLineParser& arParser, const std::vector<std::string>&
 
 }  // namespace
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  setLogCode(0);
-  return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   const std::string lLine(reinterpret_cast<const char*>(apData),
                           strnlen(reinterpret_cast<const char*>(apData), aSize));

@@ -32,22 +32,7 @@ constexpr unsigned int kMaximum = 1024 * 1024;
 // Stays below the pipe's capacity (64 KiB on Linux), so writing never waits for a reader.
 constexpr size_t kMaxStream = 60000;
 
-void writeAll(int aFd, const uint8_t* apData, size_t aSize) {
-  size_t lDone = 0;
-  while (lDone < aSize) {
-    const ssize_t lWritten = write(aFd, apData + lDone, aSize - lDone);
-    if (lWritten < 0 && errno == EINTR) continue;  // nothing was written; the same write is safe again
-    QN_FUZZ_CHECK(lWritten > 0);
-    lDone += static_cast<size_t>(lWritten);
-  }
-}
-
 }  // namespace
-
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  setLogCode(0);
-  return 0;
-}
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   if (aSize == 0) return 0;
@@ -57,7 +42,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
 
   int lPipe[2];
   QN_FUZZ_CHECK(pipe2(lPipe, O_CLOEXEC) == 0);
-  writeAll(lPipe[1], lpStream, lStreamSize);
+  qnfuzz::writeAll(lPipe[1], lpStream, lStreamSize);
   QN_FUZZ_CHECK(close(lPipe[1]) == 0);
 
   QNCFdReader* lpFdReader = new (std::nothrow) QNCFdReader(lPipe[0], true, lStagingSize);

@@ -6,8 +6,16 @@
 // crash and the input is saved; under the standalone corpus driver the test fails. An exception
 // outside the QNCException family is the same kind of fault (qnfuzz::foreignException).
 
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
+#include <string>
+
+#include "Logger.h"
 
 #define QN_FUZZ_CHECK(condition)                                                             \
   do {                                                                                       \
@@ -26,4 +34,36 @@ namespace qnfuzz {
   abort();
 }
 
+// Writes every byte (the descriptor never stays full: a pipe below its capacity, a memory file).
+inline void writeAll(int aFd, const uint8_t* apData, size_t aSize) {
+  for (size_t lDone = 0; lDone < aSize;) {
+    const ssize_t lWritten = write(aFd, apData + lDone, aSize - lDone);
+    if (lWritten < 0 && errno == EINTR) continue;  // nothing was written; the same write is safe again
+    QN_FUZZ_CHECK(lWritten > 0);
+    lDone += static_cast<size_t>(lWritten);
+  }
+}
+
+// An independent reading of apText as an optional '-' (when aSigned) and decimal digits, judged
+// by strtoll/strtoull: true with the value when it is one, within [aMin, aMax].
+inline bool decimal(const char* apText, bool aSigned, long long aMin, unsigned long long aMax,
+                    long long& arValue) {
+  const char* lpDigits = aSigned && apText[0] == '-' ? apText + 1 : apText;
+  if (*lpDigits == '\0' || strspn(lpDigits, "0123456789") != strlen(lpDigits)) return false;
+  errno = 0;
+  if (aSigned) {
+    arValue = strtoll(apText, nullptr, 10);
+    return errno != ERANGE && arValue >= aMin && arValue <= static_cast<long long>(aMax);
+  }
+  const unsigned long long lValue = strtoull(apText, nullptr, 10);
+  arValue = static_cast<long long>(lValue);
+  return errno != ERANGE && lValue <= aMax;
+}
+
 }  // namespace qnfuzz
+
+// Every target logs nothing: its properties, not its log, are what is checked.
+extern "C" int LLVMFuzzerInitialize(int*, char***) {
+  setLogCode(0);
+  return 0;
+}

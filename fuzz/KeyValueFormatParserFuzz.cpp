@@ -35,14 +35,8 @@ std::string gPath;
 
 // Replaces the memory file's contents with the input's.
 void store(const uint8_t* apData, size_t aSize) {
-  QN_FUZZ_CHECK(ftruncate(gMemoryFile, 0) == 0);
-  size_t lDone = 0;
-  while (lDone < aSize) {
-    const ssize_t lWritten = pwrite(gMemoryFile, apData + lDone, aSize - lDone, static_cast<off_t>(lDone));
-    if (lWritten < 0 && errno == EINTR) continue;  // nothing was written; the same write is safe again
-    QN_FUZZ_CHECK(lWritten > 0);
-    lDone += static_cast<size_t>(lWritten);
-  }
+  QN_FUZZ_CHECK(ftruncate(gMemoryFile, 0) == 0 && lseek(gMemoryFile, 0, SEEK_SET) == 0);
+  qnfuzz::writeAll(gMemoryFile, apData, aSize);
 }
 
 std::string folded(const char* apText, bool aFold) {
@@ -63,18 +57,13 @@ bool startsWith(const char* apText, const std::string& acrPrefix) {
 
 // getUnsigned() agrees with an independent reading of the value as a decimal unsigned int.
 void checkUnsigned(const QNCKeyValueFormatParser& acrParser, const QNCString& acrKey) {
-  const std::string lValue = acrParser.getValue(acrKey).get();
-  const bool lDigitsOnly = !lValue.empty() && lValue.find_first_not_of("0123456789") == std::string::npos;
-  errno = 0;
-  const unsigned long long lExpected = lDigitsOnly ? strtoull(lValue.c_str(), nullptr, 10) : 0;
-  const bool lInRange = lDigitsOnly && errno != ERANGE && lExpected <= 0xFFFFFFFFull;
+  long long lExpected = 0;
+  const bool lInRange = qnfuzz::decimal(acrParser.getValue(acrKey).get(), false, 0, 0xFFFFFFFFull, lExpected);
   try {
     const unsigned int lNumber = acrParser.getUnsigned(acrKey);
-    QN_FUZZ_CHECK(lInRange);
-    QN_FUZZ_CHECK(lNumber == lExpected);
+    QN_FUZZ_CHECK(lInRange && lNumber == lExpected);
   } catch (const QNCInvalidEx& acrException) {
-    QN_FUZZ_CHECK(!lInRange);
-    QN_FUZZ_CHECK(strstr(acrException.what(), "expects a number") != nullptr);
+    QN_FUZZ_CHECK(!lInRange && strstr(acrException.what(), "expects a number") != nullptr);
   }
 }
 
@@ -108,16 +97,17 @@ void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& ac
 
 }  // namespace
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  setLogCode(0);
+// The memory file is made once, on the first input.
+void openMemoryFile() {
+  if (gMemoryFile >= 0) return;
   gMemoryFile = memfd_create("qnfuzz-config", MFD_CLOEXEC);
   QN_FUZZ_CHECK(gMemoryFile >= 0);
   gPath = "/proc/self/fd/" + std::to_string(gMemoryFile);
-  return 0;
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   if (aSize == 0) return 0;
+  openMemoryFile();
   const uint8_t lFlags = apData[0];
   const bool lFold = (lFlags & 1) != 0;
   const bool lAllowDuplicates = (lFlags & 2) != 0;

@@ -147,11 +147,6 @@ bool readOne(QNCProtocolHelper& arHelper, QNCPointer<QNCReader>& arReader, Scrip
 
 }  // namespace
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-  setLogCode(0);
-  return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   if (aSize == 0) return 0;
   const uint8_t lOptions = apData[0];

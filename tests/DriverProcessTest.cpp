@@ -1,4 +1,4 @@
-// The driver's whole run in a real process (tests/programs/DriverApp.cpp): start-up order,
+// The driver's whole run in a real process (qn_test_helper as a service): start-up order,
 // shut-down on each signal, repeated signals, signals after the run, and failing steps.
 
 #include <gtest/gtest.h>
@@ -8,7 +8,6 @@
 #include <string>
 #include <vector>
 
-#include "DeathTestSupport.h"
 #include "LogSupport.h"
 #include "TestSupport.h"
 
@@ -23,9 +22,8 @@ const std::vector<std::string> kStartUpSteps = {
 class DriverProcessTest : public ::testing::Test {
  protected:
   pid_t start(const std::vector<std::string>& acrArguments) {
-    std::vector<std::string> lArgv = {qntest::builtProgram("tests/driver_app")};
-    lArgv.insert(lArgv.end(), acrArguments.begin(), acrArguments.end());
-    return qntest::spawn(lArgv, {"QN_LOG_DIR=" + mDir.path()}, stdoutPath(), mDir.file("stderr"));
+    return qntest::spawnHelper(acrArguments, stdoutPath(), mDir.file("stderr"),
+                               {"QN_LOG_DIR=" + mDir.path()});
   }
   pid_t startRunning(const std::vector<std::string>& acrArguments) {
     const pid_t lPid = start(acrArguments);

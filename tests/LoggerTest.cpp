@@ -9,7 +9,6 @@
 #include <thread>
 #include <vector>
 
-#include "DeathTestSupport.h"
 #include "LogSupport.h"
 #include "Logger.h"
 #include "QNString.h"
@@ -181,13 +180,14 @@ TEST_F(LoggerTest, ChildForkedAfterCreateLoggerDoesNotRepeatTheParentsLines) {
   EXPECT_EQ(1u, countOf(lLog, "from the child")) << lLog;
 }
 
-// Scenarios that need a process of their own: the state before CreateLogger, exit and crashes.
+// Scenarios that need a process of their own (qn_test_helper's log- modes): the state before
+// CreateLogger, exit and crashes.
 class LoggerProcessTest : public ::testing::Test {
  protected:
-  int run(const std::vector<std::string>& acrArgs) {
-    std::vector<std::string> lArgv{qntest::builtProgram("tests/LoggerProbe")};
-    lArgv.insert(lArgv.end(), acrArgs.begin(), acrArgs.end());
-    return qntest::waitExit(qntest::spawn(lArgv, {}, mDir.file("stdout"), mDir.file("stderr")));
+  int run(const std::string& acrMode, const std::string& acrLog, const std::string& acrExtra = "") {
+    std::vector<std::string> lArgs{"log-" + acrMode, acrLog};
+    if (!acrExtra.empty()) lArgs.push_back(acrExtra);
+    return qntest::waitExit(qntest::spawnHelper(lArgs, mDir.file("stdout"), mDir.file("stderr")));
   }
   std::string stdErr() const { return qntest::readFile(mDir.file("stderr")); }
 
@@ -196,7 +196,7 @@ class LoggerProcessTest : public ::testing::Test {
 };
 
 TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
-  ASSERT_EQ(0, run({"startup", mLog}));
+  ASSERT_EQ(0, run("startup", mLog));
   const std::string lLog = qntest::readFile(mLog);
   EXPECT_EQ(4u, linesOf(lLog).size()) << lLog;
   EXPECT_EQ("-T-", qntest::levelOf(lLog, ") early trace 1"));
@@ -212,7 +212,7 @@ TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
 }
 
 TEST_F(LoggerProcessTest, DaemonChildInheritsTheLinesKeptBeforeItsFork) {
-  ASSERT_EQ(0, run({"daemon", mLog}));
+  ASSERT_EQ(0, run("daemon", mLog));
   const std::vector<std::string> lLines = linesOf(qntest::readFile(mLog));
   ASSERT_EQ(2u, lLines.size());
   EXPECT_NE(std::string::npos, lLines[0].find(") before fork in "));
@@ -223,7 +223,7 @@ TEST_F(LoggerProcessTest, DaemonChildInheritsTheLinesKeptBeforeItsFork) {
 // exit(1) from a failed assertion while another thread keeps logging: nothing buffered is lost
 // and the exit does not deadlock against the logging thread.
 TEST_F(LoggerProcessTest, ExitWritesEveryBufferedLine) {
-  ASSERT_EQ(1, run({"exit", mLog}));
+  ASSERT_EQ(1, run("exit", mLog));
   const std::string lLog = qntest::readFile(mLog);
   for (int lIndex = 0; lIndex < 1000; ++lIndex)
     ASSERT_EQ(1u, countOf(lLog, ") line " + std::to_string(lIndex) + "\n")) << "line " << lIndex;
@@ -235,7 +235,7 @@ TEST_F(LoggerProcessTest, CrashSignalWritesTheBufferAndStillKillsTheProcess) {
   for (const int lSignal : {SIGSEGV, SIGBUS, SIGABRT, SIGFPE}) {
     SCOPED_TRACE(strsignal(lSignal));
     const std::string lLog = mDir.file("crash" + std::to_string(lSignal) + ".log");
-    EXPECT_EQ(128 + lSignal, run({"crash", lLog, std::to_string(lSignal)}));
+    EXPECT_EQ(128 + lSignal, run("crash", lLog, std::to_string(lSignal)));
     const std::string lText = qntest::readFile(lLog);
     EXPECT_EQ(101u, linesOf(lText).size());
     EXPECT_EQ(1u, countOf(lText, ") line 99\n"));
@@ -245,7 +245,7 @@ TEST_F(LoggerProcessTest, CrashSignalWritesTheBufferAndStillKillsTheProcess) {
 
 TEST_F(LoggerProcessTest, UnopenablePathIsReportedAndTheProcessGoesOn) {
   const std::string lBad = mDir.file("no/such/dir/x.log");
-  ASSERT_EQ(0, run({"badpath", lBad}));
+  ASSERT_EQ(0, run("badpath", lBad));
   EXPECT_NE(std::string::npos, stdErr().find("Cannot open log file '" + lBad + "'")) << stdErr();
   EXPECT_EQ("went on\n", qntest::readFile(mDir.file("stdout")));
   EXPECT_EQ(0u, countOf(stdErr(), "still here"));  // an info line never reaches the terminal

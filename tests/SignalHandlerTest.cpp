@@ -142,25 +142,4 @@ TEST_F(SignalHandlerTest, SignalOfAForkedChildNeverRunsTheHandlerInTheParent) {
   EXPECT_EQ(0, gsChildSignalRuns.load());
 }
 
-TEST_F(SignalHandlerTest, ChildThatRegistersGetsADispatcherOfItsOwn) {
-#if defined(__SANITIZE_THREAD__)
-  GTEST_SKIP() << "ThreadSanitizer cannot start a thread in the child of a multi-threaded fork";
-#endif
-  RegisterSignalHandler(SIGUSR1, countingHandler);
-  const pid_t lChild = fork();
-  ASSERT_GE(lChild, 0);
-  if (lChild == 0) {
-    RegisterSignalHandler(SIGUSR2, countingHandler);
-    raise(SIGUSR1);
-    raise(SIGUSR2);
-    for (int lTry = 0; lTry < 1000 && gsChildSignalRuns.load() < 2; ++lTry) usleep(10 * 1000);
-    _exit(gsChildSignalRuns.load());
-  }
-  int lStatus = 0;
-  ASSERT_EQ(lChild, waitpid(lChild, &lStatus, 0));
-  ASSERT_TRUE(WIFEXITED(lStatus));
-  EXPECT_EQ(2, WEXITSTATUS(lStatus));
-  EXPECT_EQ(0, gsChildSignalRuns.load()) << "the child's signals ran the handler in the parent";
-}
-
 }  // namespace

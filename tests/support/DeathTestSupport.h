@@ -6,24 +6,19 @@
 #include <ostream>
 #include <string>
 
-namespace qntest {
+#include "TestSupport.h"
 
-// How often acrText occurs in acrHaystack (occurrences may not overlap).
-inline size_t countOf(const std::string& acrHaystack, const std::string& acrText) {
-  size_t lCount = 0;
-  for (size_t lAt = acrHaystack.find(acrText); lAt != std::string::npos;
-       lAt = acrHaystack.find(acrText, lAt + acrText.size()))
-    ++lCount;
-  return lCount;
-}
+namespace qntest {
 
 // Matches output that holds exactly one "-H-" line, and that line reads
 // "Assertion [ <condition> ] failed".
 class AssertionOutputMatcher : public ::testing::MatcherInterface<const std::string&> {
  public:
-  explicit AssertionOutputMatcher(std::string aCondition) : mExpected("Assertion [ " + aCondition + " ] failed") {}
+  explicit AssertionOutputMatcher(std::string aCondition)
+      : mExpected("Assertion [ " + aCondition + " ] failed") {}
 
-  bool MatchAndExplain(const std::string& acrOutput, ::testing::MatchResultListener* apListener) const override {
+  bool MatchAndExplain(const std::string& acrOutput,
+                       ::testing::MatchResultListener* apListener) const override {
     const size_t lHaltLines = countOf(acrOutput, "-H-");
     const size_t lAt = acrOutput.find("-H-");
     const size_t lEnd = lAt == std::string::npos ? lAt : acrOutput.find('\n', lAt);

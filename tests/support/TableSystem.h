@@ -1,7 +1,8 @@
 #pragma once
-// A system object for tests of the numbered services: it fills the numbered tables
-// (conditionals, queues, lists, readers, writers) the way an application's system class does,
-// and gives tests the conditionals themselves so they can take a conditional's lock directly.
+// The one minimal system object of the tests and the helper program: the three operations every
+// application must provide (no options, no configuration file, no help), numbered tables filled
+// the way an application's system class does, the conditionals themselves so tests can take a
+// conditional's lock directly, and on request an instance manager on a given PID file.
 
 #include <atomic>
 #include <chrono>
@@ -12,6 +13,7 @@
 #include <thread>
 
 #include "Conditional.h"
+#include "ProcessInstanceManager.h"
 #include "QNException.h"
 #include "Reader.h"
 #include "SynchList.h"
@@ -38,7 +40,20 @@ inline QNCPointer<QNCQueueable> makeItem(int aId, std::atomic<int>* apDestroyed 
   return QNCPointer<QNCQueueable>(new (std::nothrow) Item(aId, apDestroyed));
 }
 
-inline int idOf(const QNCPointer<QNCQueueable>& acrElement) { return static_cast<Item*>(acrElement.get())->mId; }
+inline int idOf(const QNCPointer<QNCQueueable>& acrElement) {
+  return static_cast<Item*>(acrElement.get())->mId;
+}
+
+// Polls acrCondition until it holds or acLimit passes; says whether it held.
+inline bool eventually(const std::function<bool()>& acrCondition,
+                       std::chrono::milliseconds acLimit = std::chrono::seconds(10)) {
+  const auto lDeadline = std::chrono::steady_clock::now() + acLimit;
+  while (!acrCondition()) {
+    if (std::chrono::steady_clock::now() > lDeadline) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
+  return true;
+}
 
 // Runs acrCall on a thread of its own and reports whether it returned within acLimit, so that a
 // fault shows as a failed expectation instead of a hung test program. When the call is late,
@@ -64,7 +79,8 @@ inline bool returnsWithin(const std::function<void()>& acrCall, std::chrono::mil
 
 class TableSystem : public QNCSystem {
  public:
-  TableSystem(unsigned int aConditionals, unsigned int aQueues, unsigned int aLists) {
+  TableSystem(unsigned int aConditionals = 0, unsigned int aQueues = 0, unsigned int aLists = 0) {
+    mName = "qntest";
     for (unsigned int lIndex = 0; lIndex < aConditionals; ++lIndex)
       mWaitConditionals.append(QNCPointer<QNCConditional>(new (std::nothrow) QNCConditional));
     for (unsigned int lIndex = 0; lIndex < aQueues; ++lIndex)
@@ -77,6 +93,12 @@ class TableSystem : public QNCSystem {
   void addQueue(const QNCPointer<QNCSynchQueue>& acrQueue) { mQueues.append(acrQueue); }
   void addReader(const QNCPointer<QNCReader>& acrReader) { mReaders.append(acrReader); }
   void addWriter(const QNCPointer<QNCWriter>& acrWriter) { mWriters.append(acrWriter); }
+
+  void addBucket(unsigned int aLength) { mMemoryBufferList.pushBack(aLength); }
+  void usePidFile(const char* apPath) {
+    mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
+        new (std::nothrow) QNCProcessInstanceManager(apPath), QNPST_Individual, QNPAT_New);
+  }
 
   QNCConditional& conditional(unsigned int aNumber) { return *mWaitConditionals[aNumber]; }
 

@@ -13,6 +13,9 @@
 #include <stdexcept>
 #include <thread>
 
+#include "AllocatedBuffer.h"
+#include "Os.h"
+
 extern char** environ;
 
 namespace qntest {
@@ -101,12 +104,46 @@ bool waitForText(const std::string& acrPath, const std::string& acrText, std::ch
   return readFile(acrPath).find(acrText) != std::string::npos;
 }
 
-size_t find(const std::string& acrHaystack, const std::string& acrText, size_t aFrom) {
-  return acrHaystack.find(acrText, aFrom);
+size_t countOf(const std::string& acrHaystack, const std::string& acrText) {
+  size_t lCount = 0;
+  for (size_t lAt = acrHaystack.find(acrText); lAt != std::string::npos;
+       lAt = acrHaystack.find(acrText, lAt + acrText.size()))
+    ++lCount;
+  return lCount;
+}
+
+bool lockedByOther(const std::string& acrPath) {
+  const int lFd = open(acrPath.c_str(), O_RDONLY);
+  if (lFd < 0) return false;
+  QNEFileLockStatus lStatus = QNFLS_None;
+  OsFileLockStatus(lFd, lStatus);
+  close(lFd);
+  return lStatus == QNFLS_LockedByOther;
+}
+
+QNCPointer<QNCBuffer> bufferOf(const Bytes& acrBytes) {
+  const unsigned int lLength = static_cast<unsigned int>(acrBytes.size());
+  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow) QNCAllocatedBuffer(lLength == 0 ? 1 : lLength, 0),
+                                QNPST_Individual, QNPAT_New);
+  if (lLength != 0) memcpy(static_cast<unsigned char*>(*lBuffer), acrBytes.data(), lLength);
+  lBuffer->setLength(lLength);
+  return lBuffer;
+}
+
+Bytes bytesOf(const QNCPointer<QNCBuffer>& acrBuffer) {
+  const unsigned char* lpBytes = *acrBuffer;
+  return Bytes(lpBytes, lpBytes + acrBuffer->getLength());
 }
 
 std::string builtProgram(const std::string& acrRelativePath) {
   return std::string(QN_TEST_BINARY_DIR) + "/" + acrRelativePath;
+}
+
+pid_t spawnHelper(const std::vector<std::string>& acrArgs, const std::string& acrStdout,
+                  const std::string& acrStderr, const std::vector<std::string>& acrEnv) {
+  std::vector<std::string> lArgv{builtProgram("tests/qn_test_helper")};
+  lArgv.insert(lArgv.end(), acrArgs.begin(), acrArgs.end());
+  return spawn(lArgv, acrEnv, acrStdout, acrStderr);
 }
 
 }  // namespace qntest

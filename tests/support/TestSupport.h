@@ -7,6 +7,9 @@
 #include <string>
 #include <vector>
 
+#include "Buffer.h"
+#include "Pointer.h"
+
 namespace qntest {
 
 // A fresh directory under /tmp, removed with its contents by the destructor.
@@ -41,11 +44,23 @@ int waitExit(pid_t aPid, std::chrono::milliseconds aTimeout = std::chrono::secon
 bool waitForText(const std::string& acrPath, const std::string& acrText,
                  std::chrono::milliseconds aTimeout = std::chrono::seconds(10));
 
-// The position of acrText in acrHaystack at or after aFrom, or std::string::npos.
-size_t find(const std::string& acrHaystack, const std::string& acrText, size_t aFrom = 0);
-
 // The path of a program built beside the tests (relative to the build directory).
 std::string builtProgram(const std::string& acrRelativePath);
+// Starts tests/qn_test_helper (tests/programs/TestHelper.cpp) with the mode and its arguments.
+pid_t spawnHelper(const std::vector<std::string>& acrArgs, const std::string& acrStdout = "",
+                  const std::string& acrStderr = "", const std::vector<std::string>& acrEnv = {});
+
+// How often acrText occurs in acrHaystack (occurrences may not overlap).
+size_t countOf(const std::string& acrHaystack, const std::string& acrText);
+
+// Whether a fresh open of the file sees its lock held (open-file-description locks conflict
+// between opens even within one process, so this is what another process would see).
+bool lockedByOther(const std::string& acrPath);
+
+// A buffer holding exactly the bytes, and the bytes a buffer holds up to its used length.
+using Bytes = std::vector<unsigned char>;
+QNCPointer<QNCBuffer> bufferOf(const Bytes& acrBytes);
+Bytes bytesOf(const QNCPointer<QNCBuffer>& acrBuffer);
 
 // The message of the exception E that acrCall throws, followed by " (code N)" when aWithCode;
 // "(nothing thrown)" when the call returns. An exception of another class passes through.

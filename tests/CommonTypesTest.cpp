@@ -1,0 +1,421 @@
+// The value types of common/: the counted pointer, the containers, strings, exceptions and the
+// numeric identifiers.
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <climits>
+#include <cstring>
+#include <functional>
+#include <memory>
+#include <thread>
+
+#include "DeathTestSupport.h"
+#include "LogSupport.h"
+#include "NumericIdManager.h"
+#include "Pointer.h"
+#include "QNList.h"
+#include "QNMap.h"
+#include "QNQueue.h"
+#include "QNVector.h"
+
+namespace {
+
+using qntest::thrown;
+
+// An object that records its destruction; an optional hook runs inside the destructor, so a
+// test can look at the world at the moment the object dies.
+struct QNSTracked {
+  static std::vector<int> sDestroyed;
+  static std::function<void(int)> sOnDestroy;
+  explicit QNSTracked(int aId = 0) : mId(aId) {}
+  virtual ~QNSTracked() {
+    sDestroyed.push_back(mId);
+    if (sOnDestroy) sOnDestroy(mId);
+  }
+  int mId;
+};
+std::vector<int> QNSTracked::sDestroyed;
+std::function<void(int)> QNSTracked::sOnDestroy;
+
+// Its destructor records the negated id before the base part records the id itself.
+struct QNSDerivedTracked : QNSTracked {
+  QNSDerivedTracked() : QNSTracked(7) {}
+  ~QNSDerivedTracked() override { sDestroyed.push_back(-mId); }
+};
+
+// A node of a singly linked chain: a pointer assigned from a member of the object it releases.
+struct QNSNode {
+  explicit QNSNode(int aId) : mTracked(aId) {}
+  QNSTracked mTracked;
+  QNCPointer<QNSNode> mNext;
+};
+
+class PointerTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    QNSTracked::sDestroyed.clear();
+    QNSTracked::sOnDestroy = nullptr;
+  }
+  static QNCPointer<QNSTracked> make(int aId) {
+    return QNCPointer<QNSTracked>(new (std::nothrow) QNSTracked(aId), QNPST_Individual, QNPAT_New);
+  }
+  static std::vector<int>& destroyed() { return QNSTracked::sDestroyed; }
+};
+
+// Copies share one object and only the last reference destroys it. Assigning a pointer to itself
+// while it holds the only reference must neither destroy the object nor raise its counter.
+// Assignment releases the old object before it takes the new one; a move hands the reference
+// over and empties its source.
+TEST_F(PointerTest, OnlyTheLastReferenceDestroysTheObject) {
+  EXPECT_EQ(
+      "Out of Memory (code 2)",
+      thrown<QNCNoMemoryEx>([] { QNCPointer<QNSTracked> lNull(static_cast<QNSTracked*>(nullptr)); }, true));
+  {
+    auto* lpFirst = new QNCPointer<QNSTracked>(make(1));
+    QNCPointer<QNSTracked> lSecond(*lpFirst), lThird;
+    lThird = lSecond;
+    lThird = lSecond;  // already shares it: the count must stay right
+    delete lpFirst;
+    lSecond.reset();
+    QNCPointer<QNSTracked>& lrAlias = lThird;
+    lThird = lrAlias;
+    EXPECT_TRUE(destroyed().empty()) << "destroyed while a copy still held it";
+    QNCPointer<QNSTracked> lOther = make(2);
+    QNSTracked* lpSeenInOther = nullptr;
+    QNSTracked::sOnDestroy = [&](int aId) {
+      if (aId == 2) lpSeenInOther = lOther.get();
+    };
+    lOther = lThird;
+    EXPECT_EQ(std::vector<int>{2}, destroyed());
+    EXPECT_NE(lThird.get(), lpSeenInOther) << "the new object was taken before the old one was destroyed";
+    QNCPointer<QNSTracked> lMoved(std::move(lOther));
+    EXPECT_TRUE(lOther.isNull());  // NOLINT: the moved-from state is part of the contract
+    lThird = std::move(lMoved);
+    EXPECT_TRUE(lMoved.isNull());  // NOLINT: as above
+  }
+  EXPECT_EQ((std::vector<int>{2, 1}), destroyed());
+}
+
+// Regression: "lHead = lHead->mNext" and its move form read the source after releasing the old
+// head, and the old head owned the source, so the fields came from freed memory.
+TEST_F(PointerTest, AssigningFromAMemberOfTheReleasedObject) {
+  {
+    QNCPointer<QNSNode> lHead(new (std::nothrow) QNSNode(1), QNPST_Individual, QNPAT_New);
+    lHead->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(2), QNPST_Individual, QNPAT_New);
+    lHead->mNext->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(3), QNPST_Individual, QNPAT_New);
+    lHead = lHead->mNext;
+    EXPECT_EQ(2, lHead->mTracked.mId);
+    lHead = std::move(lHead->mNext);
+    EXPECT_EQ((std::vector<int>{1, 2}), destroyed());
+    EXPECT_EQ(3, lHead->mTracked.mId);
+  }
+  EXPECT_EQ((std::vector<int>{1, 2, 3}), destroyed());
+}
+
+// An array runs every destructor, last first (delete instead of delete[] would run one); a base
+// pointer copied from a derived one shares its counter and destroys the whole object.
+TEST_F(PointerTest, ArraysAndDerivedObjectsAreDestroyedWhole) {
+  QNSTracked* lpArray = new QNSTracked[3];
+  for (int lIndex = 0; lIndex < 3; ++lIndex) lpArray[lIndex].mId = lIndex + 1;
+  QNCPointer<QNSTracked>(lpArray, QNPST_Array, QNPAT_New).reset();
+  EXPECT_EQ((std::vector<int>{3, 2, 1}), destroyed());
+  destroyed().clear();
+  auto* lpDerived =
+      new QNCPointer<QNSDerivedTracked>(new (std::nothrow) QNSDerivedTracked, QNPST_Individual, QNPAT_New);
+  QNCPointer<QNSTracked> lBase(*lpDerived);
+  delete lpDerived;
+  EXPECT_TRUE(destroyed().empty());
+  lBase.reset();
+  EXPECT_EQ((std::vector<int>{-7, 7}), destroyed());
+}
+
+// Copies released at the same time on many threads: a counter that is not atomic loses updates
+// and destroys the object twice or never.
+TEST_F(PointerTest, CopiesReleasedOnManyThreadsDestroyTheObjectOnce) {
+  for (int lRound = 0; lRound < 20; ++lRound) {
+    destroyed().clear();
+    std::vector<QNCPointer<QNSTracked>> lCopies(8, make(0));
+    std::atomic<bool> lGo{false};
+    std::vector<std::thread> lThreads;
+    for (int lIndex = 0; lIndex < 8; ++lIndex) {
+      lThreads.emplace_back([&lGo, lMine = std::move(lCopies[lIndex]), lIndex]() mutable {
+        while (!lGo.load()) std::this_thread::yield();
+        for (int lCopy = 0; lCopy < 20000; ++lCopy) {
+          QNCPointer<QNSTracked> lLocal(lMine);
+          // One writer; whichever thread destroys the object reads this field and must see it.
+          if (lIndex == 0 && lCopy == 0) lLocal->mId = 1;
+        }
+        lMine.reset();
+      });
+    }
+    lGo.store(true);
+    for (auto& lThread : lThreads) lThread.join();
+    ASSERT_EQ(std::vector<int>{1}, destroyed()) << "round " << lRound;
+  }
+}
+
+const QNCPointer<int> gsEmpty;
+const QNCPointer<QNSTracked> gsEmptyTracked;
+
+// Misuse of a pointer or a string is a programming error: the process stops with the assertion's
+// line and status 1 rather than crash or go on with a null object.
+TEST(PointerDeathTest, MisuseIsAnAssertion) {
+  const struct {
+    std::function<void()> mMisuse;
+    const char* mCondition;
+  } lCases[] = {
+      {[] { QNCPointer<int> lCopy(gsEmpty); }, "0 != acrCopy.mPointer"},
+      {[] {
+         QNCPointer<int> lTarget(new (std::nothrow) int(3), QNPST_Individual, QNPAT_New);
+         lTarget = gsEmpty;
+       },
+       "0 != acrCopy.mPointer"},
+      {[] { (void)QNCPointer<QNSTracked>(new QNSTracked[2], QNPST_Array, QNPAT_New)->mId; },
+       "QNPST_Individual == mSizeType"},
+      {[] { (void)gsEmptyTracked->mId; }, "0 != mPointer"},
+      {[] { (void)*gsEmpty; }, "0 != mPointer"},
+      {[] { QNCString lText(static_cast<const char*>(nullptr)); }, "0 != apString"},
+  };
+  for (const auto& lrCase : lCases)
+    EXPECT_EXIT(lrCase.mMisuse(), ::testing::ExitedWithCode(1), qntest::assertionFailure(lrCase.mCondition));
+}
+
+// An element whose copies fail with std::bad_alloc on request, as an allocation inside a copy
+// would; the containers must turn that into their own exception and stay unchanged.
+struct QNSFragile {
+  static bool sFailCopies;
+  explicit QNSFragile(int aValue) : mValue(aValue) {}
+  QNSFragile(const QNSFragile& acrOther) : mValue(acrOther.mValue) {
+    if (sFailCopies) throw std::bad_alloc();
+  }
+  QNSFragile(QNSFragile&&) noexcept = default;
+  QNSFragile& operator=(const QNSFragile& acrOther) {
+    if (sFailCopies) throw std::bad_alloc();
+    mValue = acrOther.mValue;
+    return *this;
+  }
+  QNSFragile& operator=(QNSFragile&&) noexcept = default;
+  int mValue;
+};
+bool QNSFragile::sFailCopies = false;
+
+// The same, default-constructible as well: a queue recycles its nodes for it, and a copy into a
+// recycled node must fail like a fresh allocation.
+struct QNSRecyclable : QNSFragile {
+  explicit QNSRecyclable(int aValue = 0) noexcept : QNSFragile(aValue) {}
+};
+
+struct QNSHuge {
+  char mBytes[1ULL << 32];
+};
+
+const char* const kNoMemory = "Out of Memory (code 2)";
+
+TEST(ContainerTest, VectorIndexAtOrBeyondTheEndAndImpossibleReservesAreRefused) {
+  QNCVector<int> lVector(2);
+  lVector.append(10);
+  lVector.append(20);
+  const QNCVector<int>& lrConst = lVector;
+  for (unsigned int lIndex : {2u, UINT_MAX}) {
+    EXPECT_EQ("Vector out of bounds access (code 6)",
+              thrown<QNCInvalidEx>([&] { (void)lVector[lIndex]; }, true));
+    EXPECT_THROW((void)lrConst[lIndex], QNCInvalidEx);
+  }
+  EXPECT_EQ(20, lrConst[1]);
+  EXPECT_EQ("Cannot reserve space for Vector (code 6)",
+            thrown<QNCInvalidEx>([] { QNCVector<QNSHuge> lHuge(UINT_MAX); }, true));
+}
+
+// Every operation that copies an element (into a fresh node or a recycled one) turns the copy's
+// std::bad_alloc into QNCNoMemoryEx and leaves the container as it was.
+TEST(ContainerTest, FailedCopyIsOutOfMemoryAndLeavesTheContainerUnchanged) {
+  QNCVector<QNSFragile> lVector, lOtherVector;
+  lVector.append(QNSFragile(1));
+  QNCList<QNSFragile> lList, lOtherList;
+  lList.pushBack(QNSFragile(1));
+  QNCQueue<QNSFragile> lQueue;  // not default-constructible: no node recycling
+  lQueue.enqueue(QNSFragile(1));
+  QNCQueue<QNSRecyclable> lRecycling;
+  lRecycling.enqueue(QNSRecyclable(0));
+  lRecycling.enqueue(QNSRecyclable(1));
+  (void)lRecycling.dequeue();   // leaves a node to recycle
+  const QNSRecyclable lTwo(2);  // an lvalue: enqueue must copy it into the recycled node
+  QNSFragile::sFailCopies = true;
+  const std::function<void()> lCopies[] = {[&] { lVector.append(QNSFragile(2)); },
+                                           [&] { lOtherVector = lVector; },
+                                           [&] { lList.pushBack(QNSFragile(2)); },
+                                           [&] { lList.pushFront(QNSFragile(0)); },
+                                           [&] { lOtherList = lList; },
+                                           [&] { (void)lQueue.dequeue(); },
+                                           [&] { lQueue.enqueue(QNSFragile(2)); },
+                                           [&] { lRecycling.enqueue(lTwo); }};
+  for (const auto& lrCopy : lCopies) EXPECT_EQ(kNoMemory, thrown<QNCNoMemoryEx>(lrCopy, true));
+  QNSFragile::sFailCopies = false;
+  ASSERT_EQ(1u, lVector.numberOfElements());
+  EXPECT_EQ(1, lVector[0].mValue);
+  ASSERT_EQ(1u, lList.numberOfElements());
+  EXPECT_EQ(1, lList.front().mValue);
+  EXPECT_EQ(1, lQueue.dequeue().mValue);
+  lRecycling.enqueue(lTwo);
+  EXPECT_EQ(1, lRecycling.dequeue().mValue);
+  EXPECT_EQ(2, lRecycling.dequeue().mValue);
+}
+
+TEST(ContainerTest, EmptyListOperationsAreNotFoundAndLeaveItUsable) {
+  QNCList<int> lList;
+  const QNCList<int>& lrConst = lList;
+  const std::function<void()> lOnEmpty[] = {[&] { lList.popFront(); },      [&] { lList.popBack(); },
+                                            [&] { (void)lList.front(); },   [&] { (void)lList.back(); },
+                                            [&] { (void)lrConst.front(); }, [&] { (void)lrConst.back(); }};
+  for (const auto& lrCall : lOnEmpty) EXPECT_EQ("Not Found (code 8)", thrown<QNCNotFoundEx>(lrCall, true));
+  lList.pushBack(2);
+  lList.pushFront(1);
+  lList.pushBack(3);
+  lList.popFront();
+  lList.popBack();
+  EXPECT_EQ(2, lrConst.front());
+  EXPECT_EQ(2, lrConst.back());
+}
+
+// A recyclable element whose moves copy, so a moved-from element still holds its reference: only
+// a node emptied after the dequeue lets the reference go.
+struct QNSSticky {
+  QNSSticky() noexcept = default;
+  explicit QNSSticky(const std::shared_ptr<int>& acrValue) noexcept : mValue(acrValue) {}
+  QNSSticky(const QNSSticky&) = default;
+  QNSSticky(QNSSticky&& arOther) noexcept : mValue(arOther.mValue) {}
+  QNSSticky& operator=(const QNSSticky&) = default;
+  QNSSticky& operator=(QNSSticky&& arOther) noexcept {
+    mValue = arOther.mValue;
+    return *this;
+  }
+  std::shared_ptr<int> mValue;
+};
+
+// int is recycled through spare nodes, QNCString is not: either way the order holds across
+// recycled and fresh nodes, and an empty queue is "Not Found" and stays usable.
+template <class T, class Make>
+void expectFirstInFirstOut(const Make& acrMake) {
+  QNCQueue<T> lQueue;
+  EXPECT_EQ("Not Found (code 8)", thrown<QNCNotFoundEx>([&] { (void)lQueue.dequeue(); }, true));
+  for (int lValue = 1; lValue <= 3; ++lValue) lQueue.enqueue(acrMake(lValue));
+  EXPECT_EQ(acrMake(1), lQueue.dequeue());
+  EXPECT_EQ(acrMake(2), lQueue.dequeue());
+  for (int lValue = 4; lValue <= 6; ++lValue) lQueue.enqueue(acrMake(lValue));  // 6 needs a fresh node
+  EXPECT_EQ(4u, lQueue.numberOfElements());
+  for (int lValue = 3; lValue <= 6; ++lValue) EXPECT_EQ(acrMake(lValue), lQueue.dequeue());
+  EXPECT_TRUE(lQueue.isEmpty());
+}
+
+TEST(QueueTest, FirstInFirstOutAndARecycledNodeReleasesItsElement) {
+  expectFirstInFirstOut<int>([](int aValue) { return aValue; });
+  expectFirstInFirstOut<QNCString>([](int aValue) { return QNCString(std::to_string(aValue).c_str()); });
+  QNCQueue<QNSSticky> lQueue;
+  const auto lValue = std::make_shared<int>(1);
+  lQueue.enqueue(QNSSticky(lValue));
+  (void)lQueue.dequeue();
+  EXPECT_EQ(1, lValue.use_count()) << "the recycled node still holds the element";
+}
+
+// --- Map: its failures are logged.
+class MapTest : public qntest::LoggedTest {};
+
+TEST_F(MapTest, DuplicateKeepsTheOldValueAndMissingKeyIsNotFound) {
+  QNCMap<QNCString, int> lMap;
+  lMap.insert(QNCString("a"), 1);
+  EXPECT_EQ("Element already exists in map.. can't insert (code 10)",
+            thrown<QNCExistsEx>([&] { lMap.insert(QNCString("a"), 2); }, true));
+  EXPECT_EQ(1, lMap.get(QNCString("a")));
+  EXPECT_EQ(1u, lMap.numberOfElements());
+  // String keys are told apart by their whole text: "ab" is not "a", "" is a key of its own.
+  const QNCMap<QNCString, int>& lrConst = lMap;
+  EXPECT_EQ("No element for the key exists in map (code 8)",
+            thrown<QNCNotFoundEx>([&] { (void)lMap.get(QNCString("ab")); }, true));
+  EXPECT_THROW((void)lrConst.get(QNCString("")), QNCNotFoundEx);
+  const std::string lLog = log();
+  EXPECT_EQ("-E-", qntest::levelOf(lLog, "Element already existed in the map")) << lLog;
+  EXPECT_EQ("-I-", qntest::levelOf(lLog, "Element does not exist in the map")) << lLog;
+}
+
+// Equality and order compare the whole text: in each pair the left text comes first. Copies
+// never share storage.
+TEST(StringTest, EqualityAndOrderCompareTheWholeTextAndCopiesShareNothing) {
+  const std::pair<const char*, const char*> lOrdered[] = {
+      {"abc", "abd"}, {"ab", "abc"}, {"", "a"}, {"ab", "b"}};
+  for (const auto& lrPair : lOrdered) {
+    const QNCString lLeft(lrPair.first), lRight(lrPair.second);
+    EXPECT_TRUE(!(lLeft == lRight) && !(lRight == lLeft) && lLeft < lRight && !(lRight < lLeft))
+        << lrPair.first;
+  }
+  EXPECT_TRUE(QNCString("") == QNCString());
+  EXPECT_FALSE(QNCString("abc") < QNCString("abc"));
+  QNCString lSource("base"), lCopy(lSource), lAssigned("other");
+  lAssigned = lSource;
+  lCopy += QNCString("-copy");
+  lAssigned += lAssigned;  // appending itself reads the text before it grows
+  EXPECT_STREQ("base", lSource.get());
+  EXPECT_STREQ("base-copy", lCopy.get());
+  EXPECT_STREQ("basebase", lAssigned.get());
+}
+
+// Each class is caught through every base of its category and never through another; with two
+// categories and a shared virtual root, a non-virtual path would make the root ambiguous. A
+// message is a copy, cut to the maximum.
+template <class Base, class E>
+bool caughtAs(const E& acrException) {
+  try {
+    throw acrException;
+  } catch (const Base&) {
+    return true;
+  } catch (...) {
+    return false;
+  }
+}
+
+TEST(ExceptionTest, ClassesAreCaughtThroughTheirCategoryAndMessagesAreBoundedCopies) {
+  const QNCNoMemoryEx lNoMemory("Out of Memory", 2);
+  EXPECT_TRUE(caughtAs<QNCHaltEx>(lNoMemory) && caughtAs<QNCGenericException>(lNoMemory) &&
+              caughtAs<QNCException>(lNoMemory));
+  EXPECT_FALSE(caughtAs<QNCOsException>(lNoMemory));
+  const QNCExistsEx lExists("exists", 10);
+  EXPECT_TRUE(caughtAs<QNCGenericException>(lExists));
+  EXPECT_FALSE(caughtAs<QNCOsException>(lExists) || caughtAs<QNCHaltEx>(lExists));
+  char lBuffer[64];
+  snprintf(lBuffer, sizeof lBuffer, "bad frame at %d", 42);
+  const QNCReadFailedEx lException(lBuffer, 328);
+  memset(lBuffer, 'x', sizeof lBuffer - 1);
+  EXPECT_STREQ("bad frame at 42", lException.what());
+  EXPECT_EQ(QNCException::kMaxMessage - 1, strlen(QNCInvalidEx(std::string(5000, 'm').c_str(), 6).what()));
+}
+
+unsigned int nextId(QNCNumericIdManager& arManager) {
+  unsigned int lId = 0;
+  arManager.getNextId(lId);
+  return lId;
+}
+
+// Identifiers start at 1, returned ones come back first; one never issued, or returned twice,
+// is refused (a double return would hand it to two users). The bound is the last one handed out.
+TEST(NumericIdManagerTest, ReusesReturnedIdsRefusesOthersAndStopsAtTheBound) {
+  QNCNumericIdManager lManager(7);
+  for (unsigned int lExpected = 1; lExpected <= 5; ++lExpected) EXPECT_EQ(lExpected, nextId(lManager));
+  lManager.markForReuse(4);
+  lManager.markForReuse(2);
+  EXPECT_EQ(4u, nextId(lManager));
+  EXPECT_EQ(2u, nextId(lManager));
+  EXPECT_EQ("Numeric identifier 0 is not in use, cannot return it",
+            thrown<QNCInvalidEx>([&] { lManager.markForReuse(0); }));
+  EXPECT_THROW(lManager.markForReuse(6), QNCInvalidEx);
+  lManager.markForReuse(1);
+  EXPECT_THROW(lManager.markForReuse(1), QNCInvalidEx);
+  EXPECT_EQ(1u, nextId(lManager));
+  EXPECT_EQ(6u, nextId(lManager));
+  EXPECT_EQ(7u, nextId(lManager));
+  unsigned int lId = 77;
+  EXPECT_EQ("No numeric identifier is free: all of 1..7 are in use",
+            thrown<QNCNotFoundEx>([&] { lManager.getNextId(lId); }));
+  EXPECT_EQ(77u, lId);
+}
+
+}  // namespace

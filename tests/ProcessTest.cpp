@@ -1,0 +1,293 @@
+// The process as a whole: the single running instance (the PID file, its lock, stopping the
+// running instance) and daemonizing. In-process cases use several managers on one file
+// (open-file-description locks make them conflict like separate processes); process cases start
+// qn_test_helper as real instances and daemons.
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <functional>
+#include <map>
+#include <sstream>
+#include <thread>
+
+#include "Os.h"
+#include "TableSystem.h"
+#include "TestSupport.h"
+
+namespace {
+using qntest::lockedByOther;
+using qntest::readFile;
+using std::chrono::seconds;
+
+// The 4 bytes a PID file holds for aPid: little-endian, whatever the host order.
+std::string pidBytes(int aPid) {
+  std::string lBytes;
+  for (int lShift = 0; lShift < 32; lShift += 8) lBytes += static_cast<char>((aPid >> lShift) & 0xff);
+  return lBytes;
+}
+
+class InstanceTest : public ::testing::Test {
+ protected:
+  struct Tool {
+    pid_t mPid;
+    std::string mOut, mErr, mLog;
+  };
+
+  // Starts the helper in an instance mode; given acrReady, waits until it has printed that word.
+  Tool start(const std::string& acrMode, const std::string& acrReady = "", const std::string& acrGo = "") {
+    const std::string lName = "tool" + std::to_string(mCount++);
+    Tool lTool{0, mDir.file(lName + ".out"), mDir.file(lName + ".err"), mDir.file(lName + ".log")};
+    std::vector<std::string> lArgs = {acrMode, mPidFile, lTool.mLog};
+    if (!acrGo.empty()) lArgs.push_back(acrGo);
+    lTool.mPid = qntest::spawnHelper(lArgs, lTool.mOut, lTool.mErr);
+    if (!acrReady.empty()) {
+      EXPECT_TRUE(qntest::waitForText(lTool.mOut, acrReady)) << readFile(lTool.mErr);
+    }
+    return lTool;
+  }
+
+  qntest::TempDir mDir;
+  std::string mPidFile = mDir.file("service.pid");
+  int mCount = 0;
+};
+
+// Several managers in one process stand for several processes. The second one finds the file
+// naming this very process, where kill(getpid(), SIGTERM) would end the instance that asked.
+TEST_F(InstanceTest, SecondManagerSeesTheInstanceUntilItIsReleasedAndNeverSignalsItself) {
+  QNCProcessInstanceManager lRunning(mPidFile.c_str());
+  lRunning.markAsRunning();
+  EXPECT_EQ(pidBytes(getpid()), readFile(mPidFile));
+  QNCProcessInstanceManager lSecond(mPidFile.c_str());
+  EXPECT_TRUE(lSecond.isAnInstanceRunning());
+  EXPECT_EQ("Failed to terminate running instance (code 488)",
+            qntest::thrown<QNCTerminateFailedEx>([&] { lSecond.killRunningInstance(); }, true));
+  EXPECT_TRUE(lockedByOther(mPidFile));
+  lRunning.exitCleanup();
+  EXPECT_FALSE(lockedByOther(mPidFile));
+  QNCProcessInstanceManager lThird(mPidFile.c_str());
+  EXPECT_FALSE(lThird.isAnInstanceRunning());
+  lThird.killRunningInstance();  // "No instance running... cannot kill": returns quietly
+  EXPECT_FALSE(lockedByOther(mPidFile));
+}
+
+// The lock is free for a moment while the file is reopened. A start that slips into that gap
+// either writes its id and then loses the lock to us, or keeps the lock; either way the file must
+// end up naming the holder. (Regression: twenty simultaneous starts once left the id of a start
+// that had failed.)
+class GapManager : public QNCProcessInstanceManager {
+ public:
+  GapManager(const std::string& acrPath, std::function<void()> aInGap)
+      : QNCProcessInstanceManager(acrPath.c_str()), mInGap(std::move(aInGap)) {}
+  void reopenPidFile() override {
+    QNCProcessInstanceManager::reopenPidFile();
+    mInGap();
+  }
+
+ private:
+  std::function<void()> mInGap;
+};
+
+TEST_F(InstanceTest, StartInTheReopeningGapNeverLeavesTheFileNamingTheWrongProcess) {
+  const std::string lIntruderId = pidBytes(0x01020304);
+  GapManager lWinner(mPidFile, [&] { qntest::writeFile(mPidFile, lIntruderId); });
+  lWinner.markAsRunning();
+  EXPECT_EQ(pidBytes(getpid()), readFile(mPidFile));
+  lWinner.exitCleanup();
+  int lIntruderFd = -1;
+  GapManager lLoser(mPidFile, [&] {
+    lIntruderFd = open(mPidFile.c_str(), O_RDWR);
+    OsLockFile(lIntruderFd);
+    ASSERT_EQ(4, pwrite(lIntruderFd, lIntruderId.data(), 4, 0));
+  });
+  // The refusal names the descriptor and the file.
+  const std::string lRefusal = qntest::thrown<QNCFileLockFailedEx>([&] { lLoser.markAsRunning(); }, true);
+  EXPECT_NE(std::string::npos,
+            lRefusal.find("' (locked by another process): Resource temporarily unavailable (code 11)"))
+      << lRefusal;
+  EXPECT_EQ(0u, lRefusal.find("fcntl(F_OFD_SETLK) fd ")) << lRefusal;
+  EXPECT_NE(std::string::npos, lRefusal.find(" '" + mPidFile + "'")) << lRefusal;
+  EXPECT_EQ(lIntruderId, readFile(mPidFile));
+  close(lIntruderFd);
+}
+
+int openDescriptorCount() {
+  int lCount = 0;
+  for (int lFd = 0; lFd < 1024; ++lFd) lCount += fcntl(lFd, F_GETFD) != -1 ? 1 : 0;
+  return lCount;
+}
+
+TEST_F(InstanceTest, ProcStatusReadsTheIdAndNoFailureLeavesADescriptorOpen) {
+  const int lDescriptors = openDescriptorCount();
+  {
+    QNCProcessInstanceManager lManager(mDir.file("no/such/dir.pid").c_str());
+    EXPECT_THROW(lManager.markAsRunning(), QNCOpenFailedEx);
+    EXPECT_THROW(lManager.isAnInstanceRunning(), QNCOpenFailedEx);
+    lManager.exitCleanup();  // nothing held: no effect
+    qntest::writeFile(mPidFile, pidBytes(getpid()) + "tail");
+    EXPECT_NO_THROW(lManager.getProcStatusFromPidFile(mPidFile.c_str()));
+    // Two bytes of our own id would read as a small, possibly living pid: a short file names none.
+    qntest::writeFile(mPidFile, pidBytes(getpid()).substr(0, 2));
+    EXPECT_THROW(lManager.getProcStatusFromPidFile(mPidFile.c_str()), QNCClibGetProcStatusFailedEx);
+    EXPECT_THROW(lManager.getProcStatusFromPidFile(mDir.file("missing.pid").c_str()), QNCOpenFailedEx);
+  }
+  EXPECT_EQ(lDescriptors, openDescriptorCount());
+}
+
+// The first instance asks getProcStatus() about its own PID file, which opens and closes it: were
+// the lock a classic fcntl lock, owned by the process, that close would release it and the second
+// start would succeed. The second start is refused at once; "kill" ends the first by SIGTERM.
+TEST_F(InstanceTest, FirstStartHoldsTheFileSecondFailsAndKillEndsTheFirst) {
+  // The manager asks for 0640; under umask 0 (as a daemon runs) the mode is exactly that.
+  const mode_t lOldMask = umask(0);
+  Tool lFirst = start("hold", "running");
+  umask(lOldMask);
+  struct stat lStat;
+  ASSERT_EQ(0, stat(mPidFile.c_str(), &lStat));
+  EXPECT_EQ(0640u, lStat.st_mode & 07777);
+  EXPECT_EQ(pidBytes(lFirst.mPid), readFile(mPidFile));
+
+  Tool lSecond = start("hold");
+  EXPECT_EQ(1, qntest::waitExit(lSecond.mPid, seconds(10)));
+  EXPECT_EQ("error: Cannot mark running.. found another instance (code 10)\n", readFile(lSecond.mErr));
+  EXPECT_NE(std::string::npos, readFile(lSecond.mLog).find("Another instance is already running"));
+  EXPECT_EQ(pidBytes(lFirst.mPid), readFile(mPidFile));
+
+  Tool lKiller = start("kill");
+  EXPECT_EQ(0, qntest::waitExit(lKiller.mPid)) << readFile(lKiller.mErr);
+  EXPECT_EQ(0, qntest::waitExit(lFirst.mPid)) << "the instance did not end on SIGTERM by itself";
+  EXPECT_NE(std::string::npos,
+            readFile(lKiller.mLog)
+                .find("Instance with pid : " + std::to_string(lFirst.mPid) + " is terminated successfully"));
+  EXPECT_FALSE(lockedByOther(mPidFile));
+  EXPECT_EQ(pidBytes(lFirst.mPid), readFile(mPidFile));  // never deleted or cleared
+}
+
+// Also pins a lost id: A and B find no file; A creates it, locks, writes its id and runs on; B's
+// creating open then truncated the file to nothing before B found the lock held and gave up.
+TEST_F(InstanceTest, TwentySimultaneousStartsLeaveExactlyOneRunning) {
+  const std::string lGo = mDir.file("go");
+  std::vector<Tool> lTools;
+  for (int lIndex = 0; lIndex < 20; ++lIndex) lTools.push_back(start("hold", "", lGo));
+  qntest::writeFile(lGo, "");
+  // The losers end by themselves with an error of the family; the winner runs until stopped. The
+  // file may name a loser for a moment, so the winner is found by who keeps running.
+  std::vector<int> lStatus(lTools.size(), -1);
+  size_t lEnded = 0;
+  const auto lDeadline = std::chrono::steady_clock::now() + seconds(60);
+  while (lEnded + 1 < lTools.size() && std::chrono::steady_clock::now() < lDeadline) {
+    for (size_t lIndex = 0; lIndex < lTools.size(); ++lIndex) {
+      int lRaw = 0;
+      if (lStatus[lIndex] == -1 && waitpid(lTools[lIndex].mPid, &lRaw, WNOHANG) == lTools[lIndex].mPid) {
+        lStatus[lIndex] = WIFEXITED(lRaw) ? WEXITSTATUS(lRaw) : 128 + WTERMSIG(lRaw);
+        ++lEnded;
+      }
+    }
+    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+  }
+  const Tool* lpWinner = nullptr;
+  for (size_t lIndex = 0; lIndex < lTools.size(); ++lIndex) {
+    if (lStatus[lIndex] == -1) {
+      EXPECT_EQ(nullptr, lpWinner) << "two starts are running";
+      lpWinner = &lTools[lIndex];
+    } else {
+      EXPECT_EQ(1, lStatus[lIndex]);
+      EXPECT_EQ(0u, readFile(lTools[lIndex].mErr).find("error: ")) << readFile(lTools[lIndex].mErr);
+    }
+  }
+  ASSERT_NE(nullptr, lpWinner) << "no start is running";
+  EXPECT_TRUE(qntest::waitForText(lpWinner->mOut, "running"));
+  EXPECT_EQ(pidBytes(lpWinner->mPid), readFile(mPidFile));
+  kill(lpWinner->mPid, SIGTERM);
+  EXPECT_EQ(0, qntest::waitExit(lpWinner->mPid));
+}
+
+// Takes about ten seconds: ten lock attempts one second apart. The instance that would not stop
+// is then killed outright, which frees the file for the next start without a word from it.
+TEST_F(InstanceTest, KillGivesUpOnAnInstanceIgnoringSigtermAndSigkillFreesTheFile) {
+  Tool lStubborn = start("hold-stubborn", "running");
+  qntest::writeFile(mPidFile, readFile(mPidFile) + "extra");
+  Tool lKiller = start("kill");
+  EXPECT_EQ(0, qntest::waitExit(lKiller.mPid, seconds(30))) << readFile(lKiller.mErr);
+  const std::string lLog = readFile(lKiller.mLog);
+  EXPECT_NE(std::string::npos,
+            lLog.find("Failed in terminating Instance with pid " + std::to_string(lStubborn.mPid)));
+  EXPECT_EQ(10u, qntest::countOf(lLog, "Sleep for 1 second..."));
+  EXPECT_TRUE(lockedByOther(mPidFile));  // still running, still the instance
+  kill(lStubborn.mPid, SIGKILL);
+  EXPECT_EQ(128 + SIGKILL, qntest::waitExit(lStubborn.mPid));
+  Tool lNext = start("hold", "running");
+  EXPECT_EQ(pidBytes(lNext.mPid) + "extra", readFile(mPidFile));
+  kill(lNext.mPid, SIGTERM);
+  EXPECT_EQ(0, qntest::waitExit(lNext.mPid));
+  EXPECT_NE(std::string::npos, readFile(lNext.mOut).find("stopped"));
+}
+
+// The lock is held (here by this test itself) but the file names no process: 2 bytes, or id 0.
+// Read on as an int, the 2 bytes name this test when its id is below 65536; kill(0, ...) would
+// signal the killer's process group, which this test belongs to. Either mistake ends the test.
+TEST_F(InstanceTest, KillSignalsNobodyForAShortOrZeroId) {
+  for (const std::string& acrContents : {pidBytes(getpid()).substr(0, 2), pidBytes(0)}) {
+    qntest::writeFile(mPidFile, acrContents);
+    const int lHolder = open(mPidFile.c_str(), O_RDWR);
+    OsLockFile(lHolder);
+    Tool lKiller = start("kill");
+    EXPECT_EQ(1, qntest::waitExit(lKiller.mPid));
+    EXPECT_EQ("error: Failed to terminate running instance (code 488)\n", readFile(lKiller.mErr));
+    EXPECT_EQ(std::string::npos, readFile(lKiller.mLog).find("Attempting to kill"));
+    close(lHolder);
+  }
+}
+
+TEST(DaemonizeTest, CallerReturnsAtOnceAndTheDaemonIsDetached) {
+  qntest::TempDir lDir;
+  const std::string lReport = lDir.file("report"), lGo = lDir.file("go");
+  const pid_t lCaller = qntest::spawnHelper({"daemon", lReport, lGo}, lDir.file("out"), lDir.file("err"));
+  // The daemon reports only after "go": the caller ending first shows it did not wait for it.
+  ASSERT_EQ(0, qntest::waitExit(lCaller, seconds(10))) << readFile(lDir.file("err"));
+  EXPECT_NE(std::string::npos, readFile(lDir.file("err")).find("Time for parent process to quit"));
+  EXPECT_NE(0, access(lReport.c_str(), F_OK));
+  qntest::writeFile(lGo, "");
+  ASSERT_TRUE(qntest::waitForText(lReport, "done")) << "the daemon never reported";
+  std::map<std::string, std::string> lValues;
+  std::istringstream lIn(readFile(lReport));
+  for (std::string lLine; std::getline(lIn, lLine);)
+    if (lLine.find('=') != std::string::npos)
+      lValues[lLine.substr(0, lLine.find('='))] = lLine.substr(lLine.find('=') + 1);
+  EXPECT_NE(std::to_string(lCaller), lValues["ppid"]);
+  EXPECT_NE(std::to_string(getpid()), lValues["ppid"]);
+  // In a session of its own, but not its leader: it can never regain a controlling terminal.
+  EXPECT_NE(lValues["pid"], lValues["sid"]);
+  EXPECT_NE(std::to_string(getsid(0)), lValues["sid"]);
+  const std::map<std::string, std::string> lExpected = {
+      {"cwd", "/"},         {"umask", "0"},       {"sighup", "ignored"}, {"fd0", "/dev/null"},
+      {"fd1", "/dev/null"}, {"fd2", "/dev/null"}, {"others", ""}};
+  for (const auto& acrEntry : lExpected)
+    EXPECT_EQ(acrEntry.second, lValues[acrEntry.first]) << acrEntry.first;
+}
+
+// A wait of 12 seconds is checked after 5, 10 and 12: a flag set during the first step must end
+// it at the first check, well before the 12 seconds are over. A wait of 0 only checks the flag.
+TEST(WaitAndCheckExitTest, ExitFlagEndsTheWaitAtTheNextCheck) {
+  qntest::TableSystem lSystem;
+  EXPECT_NO_THROW(lSystem.waitAndCheckExit(0));
+  std::thread lStopper([&] {
+    std::this_thread::sleep_for(seconds(1));
+    lSystem.setForExit();
+  });
+  const auto lStart = std::chrono::steady_clock::now();
+  EXPECT_EQ("Process is marked for exit. (code 1)",
+            qntest::thrown<QNCHaltEx>([&] { lSystem.waitAndCheckExit(12); }, true));
+  const auto lWaited = std::chrono::steady_clock::now() - lStart;
+  lStopper.join();
+  EXPECT_GE(lWaited, seconds(5));
+  EXPECT_LT(lWaited, seconds(9));
+  EXPECT_THROW(lSystem.waitAndCheckExit(0), QNCHaltEx);
+}
+
+}  // namespace

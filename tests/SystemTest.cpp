@@ -1,0 +1,464 @@
+// The system object within one process: the driver's free functions (log path, registration),
+// starting and stopping the threads, the settings and the common command-line options.
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cstdlib>
+#include <thread>
+
+#include "DeathTestSupport.h"
+#include "IpAddress.h"
+#include "LogSupport.h"
+#include "MultiType.h"
+#include "Mutex.h"
+#include "NumericIdManager.h"
+#include "SystemGlobals.h"
+#include "TableSystem.h"
+#include "ThreadComponent.h"
+#include "ThreadPool.h"
+#include "Version.h"
+
+namespace {
+
+using qntest::expectInOrder;
+using qntest::levelOf;
+
+// The log path setLogFilePath composes with QN_LOG_DIR set to apDir (unset when null), and the
+// log directory then reported. The directory is read from the environment each time.
+std::string composed(const char* apDir, const std::string& acrName) {
+  apDir != nullptr ? setenv("QN_LOG_DIR", apDir, 1) : unsetenv("QN_LOG_DIR");
+  setLogFilePath(acrName.c_str());
+  QNCString lPath("stale"), lDir("stale");
+  getLogFilePath(lPath);
+  getLogDir(lDir);
+  return std::string(lPath.get()) + "|" + lDir.get();
+}
+
+TEST(DriverTest, LogPathIsTheVariableOrTmpAndTheNameCutTo511Characters) {
+  const std::string lFits(506, 'f'), lLong(600, 'n');
+  EXPECT_EQ("/var/log/app/svc.log|/var/log/app", composed("/var/log/app", "svc.log"));
+  EXPECT_EQ("/tmp/svc.log|/tmp", composed(nullptr, "svc.log"));
+  EXPECT_EQ("/svc.log|", composed("", "svc.log"));
+  EXPECT_EQ("/var/log/app//svc.log|/var/log/app/", composed("/var/log/app/", "svc.log"));
+  EXPECT_EQ("relative/svc.log|relative", composed("relative", "svc.log"));
+  EXPECT_EQ("/tmp/" + lFits + "|/tmp", composed(nullptr, lFits));  // exactly 511: kept whole
+  EXPECT_EQ(("/var/log/app/" + lLong).substr(0, 511) + "|/var/log/app", composed("/var/log/app", lLong));
+  EXPECT_EQ("/tmp/a|/tmp", composed(nullptr, "a"));  // nothing of the long one is left behind
+  unsetenv("QN_LOG_DIR");
+}
+
+// Run in a child process: the registration must not outlive the test.
+bool gsFirstDeleted = false;
+struct FirstSystem : qntest::TableSystem {
+  ~FirstSystem() override { gsFirstDeleted = true; }
+};
+
+TEST(DriverTest, SecondRegistrationReplacesTheFirstWithoutDeletingIt) {
+  EXPECT_EXIT(
+      {
+        static FirstSystem* spFirst = new FirstSystem;  // kept reachable for the leak checker
+        setSystemObject(spFirst);
+        auto* lpSecond = new qntest::TableSystem;
+        setSystemObject(lpSecond);
+        QNCSystem* lpSeen = nullptr;
+        getSystemObject(lpSeen);
+        exit(lpSeen == lpSecond && !gsFirstDeleted ? 0 : 2);
+      },
+      ::testing::ExitedWithCode(0), "");
+}
+
+TEST(DriverDeathTest, RegisteringNullOrRunningWithoutAnObjectIsAnAssertion) {
+  char lName[] = "driver";
+  char* lArgv[] = {lName, nullptr};
+  EXPECT_EXIT(setSystemObject(nullptr), ::testing::ExitedWithCode(1),
+              qntest::assertionFailure("0UL != apSystem"));
+  EXPECT_EXIT(SysInit(1, lArgv), ::testing::ExitedWithCode(1), qntest::assertionFailure("0 != gspSystem"));
+  EXPECT_EXIT(SysExit(), ::testing::ExitedWithCode(1), qntest::assertionFailure("0 != gspSystem"));
+}
+
+// --- Threads. A component that sleeps until asked to exit, or one that ends by itself at once
+// but refuses exit requests with exception E.
+class WaitingComponent : public QNCThreadComponent {
+ public:
+  explicit WaitingComponent(const char* apName) : QNCThreadComponent(apName) {}
+  ~WaitingComponent() override { waitForExit(); }
+
+ protected:
+  void run() override {
+    while (!waitForExitRequest(3600u * 1000u)) {
+    }
+  }
+};
+
+template <class E>
+class RefusingComponent : public QNCThreadComponent {
+ public:
+  explicit RefusingComponent(const char* apName) : QNCThreadComponent(apName) {}
+  ~RefusingComponent() override { waitForExit(); }
+  void requestExit() override {
+    ++mRequests;
+    throw E("cannot take the request", 6);
+  }
+  std::atomic<int> mRequests{0};
+
+ protected:
+  void run() override {}
+};
+
+class ThreadsSystem : public qntest::TableSystem {
+ public:
+  ~ThreadsSystem() override {
+    // The threads must be gone before the tables that own them.
+    try {
+      makeThreadsToExit();
+    } catch (const QNCException&) {
+    }
+    waitForThreads();
+  }
+  // Counts only calls made once both parsers exist: the application's descriptors go into them.
+  void setCommandLineArgumentDesc() override {
+    mDescriptorCalls += !mCommandLineParser.isNull() && !mConfigFileParser.isNull();
+  }
+  void createShutDownEvent() override {
+    ++mShutDownEvents;
+    mFlagAtShutDownEvent = isSetForExit();
+  }
+  template <class T>
+  T& addComponent(T* apComponent) {
+    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent, QNPST_Individual, QNPAT_New));
+    return *apComponent;
+  }
+  QNCThreadPool& addPool(const char* apName, unsigned int aThreads) {
+    auto* lpPool = new QNCThreadPool(apName, aThreads);
+    mThreadPools.append(QNCPointer<QNCThreadPool>(lpPool, QNPST_Individual, QNPAT_New));
+    return *lpPool;
+  }
+
+  int mDescriptorCalls = 0, mShutDownEvents = 0;
+  bool mFlagAtShutDownEvent = true;
+};
+
+class SystemTest : public qntest::LoggedTest {};
+
+// A component that refuses the exit request with QNCInvalidEx (as one never started does) must
+// not keep the components after it or any pool from being told, or waitForThreads would hang.
+TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
+  ThreadsSystem lSystem;
+  auto& lRefusing = lSystem.addComponent(new RefusingComponent<QNCInvalidEx>("alpha"));
+  auto& lWaiting = lSystem.addComponent(new WaitingComponent("beta"));
+  QNCThreadPool& lWorkers = lSystem.addPool("workers", 2);
+  QNCThreadPool& lSpare = lSystem.addPool("spare", 1);
+  EXPECT_FALSE(lSystem.isInited(0));
+  lSystem.startThreads();
+  EXPECT_TRUE(lSystem.isInited(0) && lSystem.isInited(1));
+  EXPECT_FALSE(lSystem.isInited(2));
+  lSystem.makeThreadsToExit();
+  EXPECT_EQ(1, lRefusing.mRequests);
+  EXPECT_TRUE(lWaiting.isExitRequested());
+  EXPECT_THROW(lWorkers.submit([] {}), QNCExitConditionEx);
+  EXPECT_THROW(lSpare.submit([] {}), QNCExitConditionEx);
+  lSystem.waitForThreads();  // returns: every thread was told
+  const std::string lLog = log();
+  expectInOrder(
+      lLog, {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
+             "Started Threads in Thread Pool: spare\n", "Waiting for 'alpha' thread to exit\n",
+             "Waiting for 'beta' thread to exit\n", "Waiting for threads in 'workers' ThreadPool to exit\n",
+             "Waiting for threads in 'spare' ThreadPool to exit\n"});
+  EXPECT_EQ("-N-", levelOf(lLog, "Started Thread: alpha"));
+  EXPECT_EQ("-N-", levelOf(lLog, "Waiting for threads in 'workers' ThreadPool to exit"));
+}
+
+// Nothing is caught in startThreads: the component that cannot start ends it, and neither the
+// components after it nor the pools are started. startThread then starts the one named, alone.
+TEST_F(SystemTest, StartThreadsStopsAtTheFirstComponentThatCannotStart) {
+  ThreadsSystem lSystem;
+  lSystem.addComponent(new WaitingComponent("first")).init();  // a second init() is refused
+  lSystem.addComponent(new WaitingComponent("second"));
+  lSystem.addComponent(new WaitingComponent("third"));
+  QNCThreadPool& lPool = lSystem.addPool("late", 1);
+  EXPECT_THROW(lSystem.startThreads(), QNCInvalidEx);
+  EXPECT_FALSE(lSystem.isInited(1));
+  lPool.submit([] {});  // a pool that was never started still accepts work: it was not finished
+  EXPECT_EQ(std::string::npos, log().find("Started Thread"));
+  EXPECT_EQ("Vector out of bounds access", qntest::thrown<QNCInvalidEx>([&] { lSystem.startThread(3); }));
+  lSystem.startThread(2);
+  EXPECT_FALSE(lSystem.isInited(1));
+  EXPECT_TRUE(lSystem.isInited(2));
+}
+
+// Only QNCInvalidEx is passed over: another refusal reaches the caller, the flag already set; the
+// shut-down event comes before the flag is set, and the flag never returns to false.
+TEST_F(SystemTest, ExitFlagIsSetFirstAndNeverReturnsToFalse) {
+  ThreadsSystem lSystem;
+  lSystem.addComponent(new RefusingComponent<QNCNotFoundEx>("odd"));
+  lSystem.startThreads();
+  EXPECT_FALSE(lSystem.isSetForExit());
+  EXPECT_THROW(lSystem.makeThreadsToExit(), QNCNotFoundEx);
+  EXPECT_FALSE(lSystem.mFlagAtShutDownEvent);
+  EXPECT_TRUE(lSystem.isSetForExit());
+  EXPECT_THROW(lSystem.makeThreadsToExit(), QNCNotFoundEx);  // a second signal repeats every step
+  lSystem.setForExit();
+  EXPECT_EQ(2, lSystem.mShutDownEvents);
+  EXPECT_TRUE(lSystem.isSetForExit());
+}
+
+TEST_F(SystemTest, PreInitCreatesTheParsersFirstAndInitFindsTheHostName) {
+  ThreadsSystem lSystem;
+  lSystem.preInit();
+  EXPECT_EQ(QNOS_Linux, lSystem.getOs());
+  EXPECT_EQ(1, lSystem.mDescriptorCalls);
+  lSystem.init();
+  char lHostName[256] = {0};
+  ASSERT_EQ(0, gethostname(lHostName, sizeof lHostName - 1));
+  EXPECT_STREQ(lHostName, lSystem.getHostName().get());
+  ASSERT_FALSE(lSystem.getAddress().isNull());
+  const std::string lLog = log();
+  expectInOrder(lLog, {std::string("HostName: ") + lHostName + "\n",
+                       "IpAddress: " + std::string(lSystem.getAddress()->getStringForm()) + "\n"});
+  EXPECT_EQ("-I-", levelOf(lLog, "The IP Address of the host in number form: "));
+  // init() creates the identifier manager, starting at 1.
+  unsigned int lId = 0;
+  lSystem.generateNumericId(lId);
+  EXPECT_EQ(1u, lId);
+}
+
+// --- Settings. applySettings changes the process-wide log mask and heartbeat: restored after.
+class SettingsSystem : public qntest::TableSystem {
+ public:
+  // Records the request instead of leaving the test process.
+  void systemDaemonize(QNCString acDir, QNCString acIn, QNCString acOut, QNCString acErr) override {
+    mDaemonizeCalls.push_back(std::string(acDir.get()) + "|" + acIn.get() + "|" + acOut.get() + "|" +
+                              acErr.get());
+  }
+  void useIdentifierBound(unsigned int aBound) {
+    mNumericIdManager = QNCPointer<QNCNumericIdManager>(new (std::nothrow) QNCNumericIdManager(aBound));
+    mNidCreationLock = QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex);
+  }
+  void add(const char* apKey, QNCMultiType* apValue) { addSetting(apKey, QNCPointer<QNCMultiType>(apValue)); }
+  void addAll(QNCMultiType* apDebugLevel, QNCMultiType* apHbTimeout, QNCMultiType* apDaemonize) {
+    if (apDebugLevel != nullptr) add("DebugLevel", apDebugLevel);
+    if (apHbTimeout != nullptr) add("HbTimeout", apHbTimeout);
+    if (apDaemonize != nullptr) add("Daemonize", apDaemonize);
+  }
+  std::vector<std::string> mDaemonizeCalls;
+};
+
+class SettingsTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    getLogCode(mSavedLogCode);
+    getHbTimeout(mSavedHbTimeout);
+  }
+  void TearDown() override {
+    setLogCode(mSavedLogCode);
+    setHbTimeout(mSavedHbTimeout);
+  }
+  static unsigned int logCode() {
+    unsigned int lValue = 0;
+    getLogCode(lValue);
+    return lValue;
+  }
+  static unsigned int hbTimeout() {
+    unsigned int lValue = 0;
+    getHbTimeout(lValue);
+    return lValue;
+  }
+
+  SettingsSystem mSystem;
+  unsigned int mSavedLogCode = 0, mSavedHbTimeout = 0;
+};
+
+TEST_F(SettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
+  mSystem.addAll(new QNCMultiType(121u), new QNCMultiType(45u),
+                 new QNCMultiType(static_cast<signed char>(1)));
+  mSystem.applySettings();
+  EXPECT_EQ(121u, logCode());
+  EXPECT_EQ(45u, hbTimeout());
+  EXPECT_EQ(std::vector<std::string>{"/|/dev/null|/dev/null|/dev/null"}, mSystem.mDaemonizeCalls);
+  for (signed char lOther : {0, 2, -1}) {
+    SettingsSystem lSystem;
+    lSystem.addAll(new QNCMultiType(255u), new QNCMultiType(30u), new QNCMultiType(lOther));
+    lSystem.applySettings();
+    EXPECT_TRUE(lSystem.mDaemonizeCalls.empty()) << static_cast<int>(lOther);
+  }
+}
+
+// With -c the file must supply the three keys; a missing one ends start-up after the earlier
+// ones were applied. A value of the wrong kind is an exception, not a value.
+TEST_F(SettingsTest, ApplySettingsStopsAtTheFirstMissingOrWrongKey) {
+  setHbTimeout(30);
+  mSystem.addAll(new QNCMultiType(249u), nullptr, new QNCMultiType(static_cast<signed char>(1)));
+  EXPECT_THROW(mSystem.applySettings(), QNCNotFoundEx);
+  EXPECT_EQ(249u, logCode());
+  EXPECT_EQ(30u, hbTimeout());
+  EXPECT_TRUE(mSystem.mDaemonizeCalls.empty());
+  SettingsSystem lWrongKind;
+  lWrongKind.addAll(new QNCMultiType("16"), new QNCMultiType(30u), new QNCMultiType(1u));
+  EXPECT_THROW(lWrongKind.applySettings(), QNCInvalidEx);
+}
+
+// Each thread marks the identifiers it holds in a shared table; a second holder of the same
+// identifier finds the mark already set. The small bound makes identifiers circulate.
+TEST_F(SettingsTest, ConcurrentThreadsNeverHoldTheSameIdentifier) {
+  constexpr unsigned int kBound = 32;
+  mSystem.useIdentifierBound(kBound);
+  std::vector<std::atomic<bool>> lHeld(kBound + 1);
+  std::atomic<unsigned int> lFaults{0};
+  std::vector<std::thread> lThreads;
+  for (unsigned int lThread = 0; lThread < 4; ++lThread) {
+    lThreads.emplace_back([&] {
+      std::vector<unsigned int> lMine;
+      for (unsigned int lRound = 0; lRound < 2000; ++lRound) {
+        unsigned int lId = 0;
+        mSystem.generateNumericId(lId);
+        if (lId == 0 || lId > kBound || lHeld[lId].exchange(true)) {
+          ++lFaults;
+          continue;
+        }
+        lMine.push_back(lId);
+        if (lMine.size() == kBound / 4) {
+          for (unsigned int lReturned : lMine) {
+            lHeld[lReturned].store(false);
+            mSystem.returnNumericId(lReturned);
+          }
+          lMine.clear();
+        }
+      }
+    });
+  }
+  for (std::thread& lrThread : lThreads) lrThread.join();
+  EXPECT_EQ(0u, lFaults.load());
+}
+
+// A refusal that left mNidCreationLock held would block the next call for ever.
+TEST_F(SettingsTest, IdentifierRefusalsLeaveTheLockFree) {
+  unsigned int lId = 0;
+  mSystem.useIdentifierBound(2);
+  mSystem.generateNumericId(lId);
+  mSystem.generateNumericId(lId);
+  EXPECT_THROW(mSystem.generateNumericId(lId), QNCNotFoundEx);
+  EXPECT_THROW(mSystem.returnNumericId(7), QNCInvalidEx);
+  mSystem.returnNumericId(1);
+  mSystem.generateNumericId(lId);
+  EXPECT_EQ(1u, lId);
+}
+
+// --- The common command-line options, run in-process. The instance operations are faked so that
+// "-s" can be followed without a second process; each call prints a marker.
+const QNSCommandLineArgumentDesc kCommonOptions[] = {
+    {"-v", 0, "", ""},     {"-h", 0, "", ""},        {"-s", 0, "", ""},     {"-c", 1, "file", ""},
+    {"-d", 1, "mask", ""}, {"-b", 1, "seconds", ""}, {"-D", 1, "bool", ""}, {"-I", 1, "minutes", ""},
+};
+
+class CommandLineSystem : public qntest::TableSystem {
+ public:
+  explicit CommandLineSystem(bool aConfigAsFlag = false) : mConfigAsFlag(aConfigAsFlag) {
+    mName = "sensortest";
+    mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("9.8.7"));
+  }
+  void setCommandLineArgumentDesc() override {
+    for (QNSCommandLineArgumentDesc lDesc : kCommonOptions) {
+      if (mConfigAsFlag && std::string(lDesc.mOption) == "-c") lDesc.mTakesValue = 0;
+      mCommandLineArgumentDesc.append(lDesc);
+    }
+  }
+  bool isAnInstanceRunning() override {
+    printf("[checked]");
+    return mInstanceRunning;
+  }
+  void killRunningInstance() override { printf("[killed]"); }
+  // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest".
+  void process(const std::vector<std::string>& acrArguments) {
+    std::vector<std::string> lStorage{"sensortest"};
+    lStorage.insert(lStorage.end(), acrArguments.begin(), acrArguments.end());
+    std::vector<char*> lArgv;
+    for (std::string& lrArgument : lStorage) lArgv.push_back(&lrArgument[0]);
+    lArgv.push_back(nullptr);
+    preInit();
+    processCommandLine(static_cast<int>(lStorage.size()), lArgv.data());
+  }
+  int value(const char* apKey) {
+    QNCPointer<QNCMultiType> lValue;
+    getSetting(apKey, lValue);
+    return std::string(apKey) == "Daemonize" ? static_cast<signed char>(*lValue)
+                                             : static_cast<int>(static_cast<unsigned int>(*lValue));
+  }
+  unsigned int settingCount() const { return mSettings.numberOfElements(); }
+  bool mInstanceRunning = false;
+
+ private:
+  bool mConfigAsFlag;
+};
+
+// Logs to a file of its own, with a recognisable log mask and heartbeat, so the defaults can be
+// told from constants. Nothing here applies the settings.
+class CommandLineTest : public qntest::LoggedTest {
+ protected:
+  void SetUp() override {
+    LoggedTest::SetUp();
+    setLogCode(249);
+    setHbTimeout(41);
+  }
+};
+
+// An option given replaces only its own setting; the others take the logger's mask and heartbeat,
+// daemonizing and the 15-minute interval. Numbers are read like atoi (a bad one is 0, a trailing
+// word ignored) and Daemonize is 1 only for exactly "true".
+TEST_F(CommandLineTest, GivenValuesReplaceOnlyTheirOwnDefaultsReadLikeAtoi) {
+  CommandLineSystem lSystem;
+  lSystem.process({"-d", "16", "-I", "30"});
+  EXPECT_EQ(16, lSystem.value("DebugLevel"));
+  EXPECT_EQ(41, lSystem.value("HbTimeout"));
+  EXPECT_EQ(1, lSystem.value("Daemonize"));
+  EXPECT_EQ(30, lSystem.value("DBReopenInterval"));
+  EXPECT_EQ(4u, lSystem.settingCount()) << "ConfigFile is written only for -c";
+  CommandLineSystem lBare;
+  lBare.process({});
+  EXPECT_EQ(249, lBare.value("DebugLevel"));
+  EXPECT_EQ(15, lBare.value("DBReopenInterval"));
+  const struct {
+    const char *mOption, *mValue, *mKey;
+    int mExpected;
+  } lCases[] = {
+      {"-D", "true", "Daemonize", 1},      {"-D", "TRUE", "Daemonize", 0},
+      {"-D", "1", "Daemonize", 0},         {"-I", "0", "DBReopenInterval", 0},
+      {"-I", "-5", "DBReopenInterval", 0}, {"-I", "7min", "DBReopenInterval", 7},
+      {"-d", "abc", "DebugLevel", 0},      {"-b", "45", "HbTimeout", 45},
+  };
+  for (const auto& lrCase : lCases) {
+    CommandLineSystem lCaseSystem;
+    lCaseSystem.process({lrCase.mOption, lrCase.mValue});
+    EXPECT_EQ(lrCase.mExpected, lCaseSystem.value(lrCase.mKey)) << lrCase.mOption << " " << lrCase.mValue;
+  }
+  expectInOrder(
+      log(), {"Command line : '-d 16 -I 30'", "Processed the command line successfully : -d 16 -I 30",
+              "No arguments in command line", "The -I option is not specified, using default interval 15 min",
+              "Zero/Invalid value specified for -I option. DB won't be reopened at fixed intervals"});
+}
+
+// -s stops a running instance, or says that there is none; either way the process leaves through
+// QNCParentExitEx before any setting is written.
+TEST_F(CommandLineTest, ShutdownStopsTheRunningInstanceAndLeavesWithParentExit) {
+  for (const bool lRunning : {true, false}) {
+    CommandLineSystem lSystem;
+    lSystem.mInstanceRunning = lRunning;
+    testing::internal::CaptureStdout();
+    const std::string lThrown = qntest::thrown<QNCParentExitEx>([&] { lSystem.process({"-s"}); }, true);
+    EXPECT_EQ(lRunning ? "Done.. time to exit (code 19)" : "Done (nothing).. time to exit (code 19)",
+              lThrown);
+    EXPECT_EQ(lRunning ? "[checked][killed]sensortest shutdown successfully.\n" : "[checked]",
+              testing::internal::GetCapturedStdout());
+    EXPECT_EQ(0u, lSystem.settingCount());
+  }
+  EXPECT_NE(std::string::npos, log().find("No instance running.. cannot kill"));
+}
+
+TEST(CommandLineDeathTest, ConfigFileDescribedWithoutValueIsAnAssertion) {
+  CommandLineSystem lSystem(true);
+  EXPECT_EXIT(lSystem.process({"-c"}), ::testing::ExitedWithCode(1),
+              "Assertion \\[ __null != lpArg \\] failed");
+}
+
+}  // namespace
