@@ -1,2 +1,0 @@
-# SensorSecurityTest starts the example service and its client: build them with the test.
-add_dependencies(SensorSecurityTest qnsensord qnsensor-feed)
