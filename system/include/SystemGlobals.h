@@ -6,6 +6,7 @@
 //     setSystemObject(new MySystem);      // the driver owns it from now on
 //     setLogFilePath("myservice.log");    // $QN_LOG_DIR/myservice.log, else /tmp/myservice.log
 //     SystemMain(argc, argv);             // returns after an orderly shut-down
+//     return getRunExitStatus();          // 1 when a thread died and ended the run
 //   }
 //
 // SystemMain enables every log level, runs SysInit (the lifecycle operations of QNCSystem in
@@ -40,3 +41,11 @@ void getLogDir(QNCString& arDir);
 void SysInit(int argc, char** argv);
 void SysExit();
 void SystemMain(int argc, char** argv);
+
+// The status main should return once SystemMain has returned: 0, or 1 when the run failed
+// because a thread component or pool thread ended by an exception (ThreadComponent.h,
+// ThreadPool.h; the orderly exit then started by itself). Any thread, at any time.
+int getRunExitStatus();
+// True once the run has failed (the same fact as getRunExitStatus() != 0). One atomic load, no
+// lock: cheap enough for a watchdog or a health check to poll from any thread.
+bool hasRunFailed();
