@@ -21,8 +21,9 @@
 // conditionals, channels, queues, lists, settings reads, the exit flag) may be called from any
 // thread once start-up has finished. Locks: mExitLock guards mExitFlag only; mNidCreationLock
 // guards mNumericIdManager only; each conditional, queue, list and buffer bucket has its own.
-// The only nesting is a conditional's lock held while a list's or queue's lock is taken for an
-// emptiness test; the reverse never happens.
+// The only nesting is a conditional's lock held while a list's or queue's lock (an emptiness test,
+// the take of the exit-aware waits) or mExitLock (their exit test) is taken; the reverse never
+// happens.
 //
 // Numbers given to the numbered services are checked by assertions: a number out of range is a
 // bug of the caller and ends the process with exit status 1.
@@ -57,6 +58,13 @@ class QNCWriter;
 
 // The elements of a synchronised list and the iterators that walk it.
 using QNCQueueableList = QNCList<QNCPointer<QNCQueueable>>;
+
+// How an exit-aware wait ended (waitOnEmptyListOrExit and its kin).
+enum QNEWaitStatus : unsigned char {
+  QNWS_Ready = 0,     // the list or queue holds an element (the take: it has been removed)
+  QNWS_Exit = 1,      // the process is marked for exit and the list or queue is empty
+  QNWS_TimedOut = 2,  // the time limit passed with the list or queue still empty
+};
 
 class QNCSystem : public QNCSystemInterface {
  public:
@@ -135,16 +143,9 @@ class QNCSystem : public QNCSystemInterface {
   // that needs a condition keeps it itself). timedWait(): the same, at most aWaitTime
   // milliseconds on the monotonic clock; a time-out throws QNCTimeOutEx. Both release the
   // conditional's lock before any exception leaves, so the conditional stays usable.
-  // Neither looks at the exit flag, and shut-down signals no conditional. A thread that must end
-  // on request waits in slices and checks the flag between them:
-  //   while (!isSetForExit()) {
-  //     if (isListEmpty(l)) {
-  //       try { timedWait(c, 1000); } catch (QNCTimeOutEx&) { continue; }
-  //     }
-  //     try { handle(delist(l)); } catch (QNCNotFoundEx&) {}  // another consumer was first
-  //   }
-  // A signal between isListEmpty() and timedWait() is not seen by that wait; it delays the
-  // element by at most one slice and never loses it, and the exit request by at most one slice.
+  // Neither looks at the exit flag; makeThreadsToExit wakes every waiter once (wait() then
+  // returns as after any wake-up). A thread that must end on request uses the exit-aware waits
+  // below (delistOrExit, waitOnEmptyListOrExit, ...).
   virtual void wait(unsigned int acConditionNo);
   virtual void timedWait(unsigned int acConditionNo, unsigned int aWaitTime);
   // send/receive: write/read on writer/reader acWriterNo/acReaderNo (separate objects); no lock
@@ -158,12 +159,12 @@ class QNCSystem : public QNCSystemInterface {
   // safe from any thread; element order, exceptions and locking are the companion's.
   // waitOnEmptyQueue/waitOnEmptyList: block without a time limit until queue/list n holds an
   // element, testing it under conditional acConditionNo's lock and waiting on that conditional;
-  // return at once when it already holds one (waitOnEmptyList then does not even take the
-  // conditional's lock, so a busy consumer does not contend with its producers' signal()).
-  // They neither remove the element (another consumer may take it before the caller's
-  // dequeue/delist) nor look at the exit flag (see timedWait for a wait that ends on request).
+  // return without waiting when it already holds one (after one pass through the conditional's
+  // lock). They neither remove the element (another consumer may take it before the caller's
+  // dequeue/delist) nor look at the exit flag (see delistOrExit for a wait that ends on request).
   // The conditional's lock is released before any exception leaves.
   // enqueue/enlist/enlistFront signal nothing: the producer follows them with signal(c).
+  // The exit-aware waits are declared after destroyThreads (they came later).
   virtual void waitOnEmptyQueue(unsigned int acConditionNo, unsigned int acQueueNo);
   virtual void enqueue(unsigned int acQueueNo, const QNCPointer<QNCQueueable>& acrElement);
   virtual QNCPointer<QNCQueueable> dequeue(unsigned int acQueueNo);
@@ -208,6 +209,27 @@ class QNCSystem : public QNCSystemInterface {
   // what ClibChdir throws.
   virtual void systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString acStdOut, QNCString acStdErr);
   virtual void destroyThreads();
+
+  // --- Exit-aware waits. They wait on conditional acConditionNo (numbers asserted first) until
+  // list/queue n holds an element (QNWS_Ready), the process is marked for exit (QNWS_Exit) or
+  // aMaxWaitMs milliseconds have passed on the monotonic clock (QNWS_TimedOut; 0: no limit), and
+  // say which. An element wins over the exit request, so consumers drain what was handed over
+  // before they end. makeThreadsToExit wakes them at once; the producer's enlist/enqueue and
+  // signal(c) wake them as for waitOnEmptyList. Thread-safe; the conditional's lock is released
+  // before any exception (the list's or queue's) leaves.
+  // waitOn...OrExit only wait: another consumer may take the element before the caller does.
+  virtual QNEWaitStatus waitOnEmptyListOrExit(unsigned int acConditionNo, unsigned int acListNo,
+                                              unsigned int aMaxWaitMs);
+  virtual QNEWaitStatus waitOnEmptyQueueOrExit(unsigned int acConditionNo, unsigned int acQueueNo,
+                                               unsigned int aMaxWaitMs);
+  // delistOrExit/dequeueOrExit wait the same way and take the head in the same call: on
+  // QNWS_Ready arElement holds the removed head, otherwise it is empty (its former object is
+  // released on entry, before any lock). An element that is there already costs one pass through
+  // the list's or queue's lock and none through the conditional's.
+  virtual QNEWaitStatus delistOrExit(unsigned int acConditionNo, unsigned int acListNo, unsigned int aMaxWaitMs,
+                                     QNCPointer<QNCQueueable>& arElement);
+  virtual QNEWaitStatus dequeueOrExit(unsigned int acConditionNo, unsigned int acQueueNo, unsigned int aMaxWaitMs,
+                                      QNCPointer<QNCQueueable>& arElement);
 
   // --- Non-virtual members.
   void checkCommandLine(int argc, char** argv, QNCString& aCommandLine);
