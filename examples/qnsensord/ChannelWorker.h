@@ -3,9 +3,17 @@
 // its reader, reads one framed reading with the system's protocol helper, gives an accepted
 // reading a numeric identifier, wraps it in a QNCSensorReadingItem, enlists it on the list of
 // readings and signals the consumer. A malformed reading is enlisted too, refused, so its answer
-// keeps its place in the connection's order. A client that leaves, between messages or in the
-// middle of one, ends only its own connection.
-// It looks at the exit request at least every 200 ms.
+// keeps its place in the connection's order.
+//
+// What a client can do to a channel costs that client's connection only, never the channel:
+// - leaving between messages or in the middle of one, or resetting the connection (ECONNRESET):
+//   the connection is dropped and the next client is taken;
+// - sending nothing, or stalling in the middle of a message: a connection that completes no
+//   message within the idle limit (the IdleLimit setting, seconds) is dropped.
+// It looks at the exit request at least every 200 ms, also while it waits for the rest of a
+// message: a body read gives up at once when exit is requested.
+
+#include <chrono>
 
 #include "ThreadComponent.h"
 
@@ -14,15 +22,24 @@ class QNCSensorSystem;
 
 class QNCChannelWorker : public QNCThreadComponent {
  public:
-  QNCChannelWorker(QNCSensorSystem& arSystem, QNCSensorChannel& arChannel, unsigned int aChannelNo);
+  QNCChannelWorker(QNCSensorSystem& arSystem, QNCSensorChannel& arChannel, unsigned int aChannelNo,
+                   unsigned int aIdleLimitSeconds);
+
+  // True once the current connection has completed no message for longer than the idle limit,
+  // or exit has been requested: a read of that connection should give up.
+  bool mustGiveUp() const;
 
  protected:
   void run() override;
 
  private:
+  void _serveOnce();
   void _handleMessage();
 
   QNCSensorSystem& mSystem;
   QNCSensorChannel& mChannel;
   const unsigned int mChannelNo;
+  const std::chrono::seconds mIdleLimit;
+  unsigned long mGeneration;                            // the connection mLastProgress belongs to
+  std::chrono::steady_clock::time_point mLastProgress;  // its accept or its last whole message
 };

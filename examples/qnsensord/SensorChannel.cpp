@@ -69,7 +69,8 @@ bool QNCSensorChannel::waitForActivity(unsigned int aMilliseconds) {
   // A read wait: the body of a reading may trail its prefix by a moment.
   QNCPointer<QNCFdReader> lNewReader(new (std::nothrow) QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
                                      QNPST_Individual, QNPAT_New);
-  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, 5000), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, kAnswerDrainMs), QNPST_Individual,
+                                     QNPAT_New);
   QNCMutexLocker lGuard(mLock);
   mReader = lNewReader;
   mWriter = lNewWriter;
@@ -100,9 +101,21 @@ void QNCSensorChannel::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCou
 
 bool QNCSensorChannel::writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer,
                                       unsigned int& arCount) {
+  QNCPointer<QNCFdReader> lReader;  // declared before the guard: released after the lock
+  QNCPointer<QNCFdWriter> lWriter;
   QNCMutexLocker lGuard(mLock);
   if (mWriter.isNull() || mGeneration != acGeneration) return false;
-  mWriter->write(acrBuffer, arCount);
+  try {
+    mWriter->write(acrBuffer, arCount);
+  } catch (const QNCTimeOutEx&) {
+    // A client that leaves its answers unread: its connection ends here, so no later answer,
+    // for this client or any other, waits on it again.
+    QN_LOG_INFO("Channel %s: connection %lu ended", mPath.c_str(), mGeneration);
+    lReader = std::move(mReader);
+    lWriter = std::move(mWriter);
+    mGeneration = 0;
+    throw;
+  }
   return true;
 }
 

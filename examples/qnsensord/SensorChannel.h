@@ -24,6 +24,10 @@
 
 class QNCSensorChannel {
  public:
+  // How long an answer may wait for its client to drain the socket (whose buffer holds a few
+  // hundred answers) before the connection is ended.
+  static constexpr unsigned int kAnswerDrainMs = 100;
+
   // Binds and listens at acrPath, replacing a socket file left by an earlier run.
   // Throws QNCOpenFailedEx naming the path when the socket cannot be set up.
   explicit QNCSensorChannel(const std::string& acrPath);
@@ -42,7 +46,8 @@ class QNCSensorChannel {
   void read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
 
   // Writes to the current connection if it is still generation acGeneration; returns false (and
-  // writes nothing) when that connection has ended.
+  // writes nothing) when that connection has ended. A client whose socket stays full for
+  // kAnswerDrainMs loses its connection: QNCTimeOutEx, and the connection is ended.
   bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount);
 
   // Ends the current connection (after the end of its stream, or a message that failed).
