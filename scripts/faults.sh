@@ -2,7 +2,8 @@
 # Fault injection against qnsensord with libfiu (Debian: libfiu-dev, fiu-utils; installed here
 # when missing). Each of fork, open, write, close, socket, bind, accept, poll and pthread_create
 # fails, alone, from start-up on and, separately, for 2 s while the service runs under load
-# (pthread_create through a small preload of our own, libfiu has no failure point for it; fork
+# (pthread_create and accept4 through a small preload of our own, libfiu has no failure point for
+# them; fork
 # only at start-up, as a daemon: the service forks nowhere else).
 # Each case must end in one of two ways, never a hang or a crash:
 #   "stops"  : the service ends with a message and a non-zero status, no process is left, and
@@ -25,20 +26,33 @@ service="$PWD/$build/examples/qnsensord"
 feed="$PWD/$build/examples/qnsensor-feed"
 
 work=$(mktemp -d /tmp/qnfaults.XXXXXX)
-# pthread_create fails once QN_FAIL_THREADS is set and the file it names exists.
+# Calls libfiu has no failure point for: pthread_create, and accept4 (the service's accept; libfiu
+# wraps only accept). Each fails while the file named by QN_FAIL_<CALL> exists.
 cat >"$work/failthread.c" <<'C'
 #define _GNU_SOURCE
 #include <dlfcn.h>
 #include <errno.h>
 #include <pthread.h>
 #include <stdlib.h>
+#include <sys/socket.h>
 #include <unistd.h>
+static int failing(const char* name) {
+  const char* flag = getenv(name);
+  return flag && access(flag, F_OK) == 0;
+}
 int pthread_create(pthread_t* t, const pthread_attr_t* a, void* (*f)(void*), void* p) {
   static int (*real)(pthread_t*, const pthread_attr_t*, void* (*)(void*), void*);
   if (!real) real = (int (*)(pthread_t*, const pthread_attr_t*, void* (*)(void*), void*))dlsym(RTLD_NEXT, "pthread_create");
-  const char* on = getenv("QN_FAIL_THREADS");
-  if (on && access(on, F_OK) == 0) return EAGAIN;
-  return real(t, a, f, p);
+  return failing("QN_FAIL_PTHREAD_CREATE") ? EAGAIN : real(t, a, f, p);
+}
+int accept4(int fd, struct sockaddr* addr, socklen_t* len, int flags) {
+  static int (*real)(int, struct sockaddr*, socklen_t*, int);
+  if (!real) real = (int (*)(int, struct sockaddr*, socklen_t*, int))dlsym(RTLD_NEXT, "accept4");
+  if (failing("QN_FAIL_ACCEPT")) {
+    errno = EMFILE;
+    return -1;
+  }
+  return real(fd, addr, len, flags);
 }
 C
 cc -shared -fPIC -O2 -o "$work/failthread.so" "$work/failthread.c" -ldl || exit 2
@@ -80,11 +94,11 @@ run_case() {  # name fail-point phase
   local daemon=false
   [ "$name" = fork ] && daemon=true
   local flag="$dir/fail-threads"
-  # fiu-run sets LD_PRELOAD itself, so pthread_create's preload goes without it.
-  local -a wrap=(env LD_PRELOAD="$work/failthread.so" QN_FAIL_THREADS="$flag")
-  [ "$name" = pthread_create ] || wrap=(fiu-run -x -f "$dir/ctl")
+  # fiu-run sets LD_PRELOAD itself, so our own preload goes without it.
+  local -a wrap=(env LD_PRELOAD="$work/failthread.so" QN_FAIL_PTHREAD_CREATE="$flag" QN_FAIL_ACCEPT="$flag")
+  [ -z "$point" ] || wrap=(fiu-run -x -f "$dir/ctl")
   if [ "$phase" = start-up ]; then
-    if [ "$name" = pthread_create ]; then touch "$flag"; else wrap+=(-c "enable name=$point"); fi
+    if [ -z "$point" ]; then touch "$flag"; else wrap+=(-c "enable name=$point"); fi
   fi
   QN_LOG_DIR=$dir "${wrap[@]}" "$service" -D $daemon -d 57 >"$dir/out" 2>"$dir/err" &
   local pid=$!
@@ -97,9 +111,9 @@ run_case() {  # name fail-point phase
     QN_LOG_DIR=$dir "$feed" -n 200000 -m 2 >/dev/null 2>&1 &
     local load=$!
     sleep 0.5
-    if [ "$name" = pthread_create ]; then touch "$flag"; else fiu-ctrl -f "$dir/ctl" -c "enable name=$point" $pid; fi
+    if [ -z "$point" ]; then touch "$flag"; else fiu-ctrl -f "$dir/ctl" -c "enable name=$point" $pid; fi
     sleep 2
-    if [ "$name" = pthread_create ]; then rm -f "$flag"; else fiu-ctrl -f "$dir/ctl" -c "disable name=$point" $pid 2>/dev/null; fi
+    if [ -z "$point" ]; then rm -f "$flag"; else fiu-ctrl -f "$dir/ctl" -c "disable name=$point" $pid 2>/dev/null; fi
     kill $load 2>/dev/null; wait $load 2>/dev/null
   fi
   local status
@@ -151,7 +165,8 @@ for name in open write close socket bind accept poll pthread_create; do
   case $name in
     open | close) point=posix/io/oc/$name ;;
     write) point=posix/io/rw/write ;;
-    socket | bind | accept) point=posix/io/net/$name ;;
+    socket | bind) point=posix/io/net/$name ;;
+    accept) point="" ;;  # accept4, by our preload
     poll) point=posix/io/net/poll ;;
     pthread_create) point="" ;;
   esac

@@ -11,6 +11,8 @@
 #include "SensorSystem.h"
 
 namespace {
+constexpr unsigned int kFailuresInRowToGiveUp = 25;  // with a 200 ms pause after each: 5 s
+
 QNCString workerName(unsigned int aChannelNo) {
   const std::string lName = "ChannelWorker-" + std::to_string(aChannelNo);
   return QNCString(lName.c_str());
@@ -51,14 +53,22 @@ bool QNCChannelWorker::mustGiveUp() const {
 }
 
 void QNCChannelWorker::run() {
+  unsigned int lFailuresInRow = 0;
   while (!isExitRequested()) {
     try {
       _serveOnce();
+      lFailuresInRow = 0;
     } catch (const QNCException& acrFailure) {
       // A failure of one connection's socket (a reset reported at the end of the stream, ...)
       // ends that connection, never the channel.
       QN_LOG_WARNING("Channel %u: connection dropped: %s", mChannelNo, acrFailure.what());
       mChannel.dropConnection();
+      // Failures with no success between them for 5 s are the channel's own (its listening
+      // socket, the process's descriptors or memory), not a client's: the thread gives up, which
+      // ends the run in order with exit status 1 for a supervisor to restart it. The pause keeps
+      // a failing call from spinning meanwhile.
+      if (++lFailuresInRow >= kFailuresInRowToGiveUp) throw;
+      waitForExitRequest(200);
     }
   }
 }

@@ -58,9 +58,17 @@ bool QNCSensorChannel::waitForActivity(unsigned int aMilliseconds) {
   if (!lReader.isNull()) return lReader->waitForActivity(aMilliseconds);
 
   struct pollfd lPoll = {mListenFd, POLLIN, 0};
-  if (poll(&lPoll, 1, static_cast<int>(aMilliseconds)) <= 0) return false;
+  const int lReady = poll(&lPoll, 1, static_cast<int>(aMilliseconds));
+  if (lReady < 0 && errno != EINTR) throwSocketError("poll", mPath);  // else the caller would spin
+  if (lReady <= 0) return false;
   const int lFd = accept4(mListenFd, nullptr, nullptr, SOCK_CLOEXEC);
-  if (lFd < 0) return false;  // the client gave up before it was accepted
+  if (lFd < 0) {
+    // The client gave up before it was accepted: nothing lost. Anything else (no descriptor or
+    // memory left) is the service's own trouble and must not pass as an idle channel.
+    if (errno == EAGAIN || errno == EWOULDBLOCK || errno == ECONNABORTED || errno == EINTR || errno == EPROTO)
+      return false;
+    throwSocketError("accept", mPath);
+  }
   const int lWriteFd = dup(lFd);
   if (lWriteFd < 0) {
     close(lFd);

@@ -37,6 +37,8 @@ class QNCSensorChannel {
 
   // Waits at most aMilliseconds. Without a connection, accepts one that is waiting. Returns true
   // when the current connection has bytes to read or has ended.
+  // Throws QNCOpenFailedEx naming the path when poll or accept on the listening socket fails for
+  // a reason other than a client that gave up (no descriptor or memory left, ...).
   bool waitForActivity(unsigned int aMilliseconds);
 
   // True when the current connection's client has closed it and every byte has been read.
