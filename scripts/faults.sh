@@ -95,7 +95,7 @@ run_case() {  # name fail-point phase
   [ "$name" = fork ] && daemon=true
   local flag="$dir/fail-threads"
   # fiu-run sets LD_PRELOAD itself, so our own preload goes without it.
-  local -a wrap=(env LD_PRELOAD="$work/failthread.so" QN_FAIL_PTHREAD_CREATE="$flag" QN_FAIL_ACCEPT="$flag")
+  local -a wrap=(env LD_PRELOAD="$work/failthread.so" "QN_FAIL_${name^^}=$flag")
   [ -z "$point" ] || wrap=(fiu-run -x -f "$dir/ctl")
   if [ "$phase" = start-up ]; then
     if [ -z "$point" ]; then touch "$flag"; else wrap+=(-c "enable name=$point"); fi
@@ -144,10 +144,12 @@ run_case() {  # name fail-point phase
     [ "$status" = running ] && { kill -9 $pid; report "$name" "$phase" FAILED "hangs: neither serves nor stops"; return; }
   fi
   local message
-  # The first error: standard error, else an error or halt line of the log (not the note that
-  # no configuration file is read).
-  message=$( (cat "$dir/err"; grep -E -- " -[EH]- " "$dir/qnsensord.log" 2>/dev/null | grep -v "Config file parsing" |
-    sed 's/^.*) //') | head -1 | cut -c1-110)
+  # What main printed ("qnsensord: ..."), else the last error or halt line (not the note that no
+  # configuration file is read; the log goes to standard error until the log file is open).
+  message=$(grep -h '^qnsensord:' "$dir/err" | tail -1)
+  [ -n "$message" ] || message=$(grep -h -E -- " -[EH]- " "$dir/err" "$dir/qnsensord.log" 2>/dev/null |
+    grep -v "Config file parsing" | tail -1 | sed 's/^.*) //')
+  message=$(echo "$message" | cut -c1-120)
   if [ "$status" -ge 128 ] 2>/dev/null; then
     report "$name" "$phase" FAILED "crashed (status $status): $message"
   elif [ "$status" = 0 ] || [ -z "$message" ]; then

@@ -56,14 +56,13 @@ void QNCChannelWorker::run() {
   unsigned int lFailuresInRow = 0;
   while (!isExitRequested()) {
     try {
-      _serveOnce();
-      lFailuresInRow = 0;
+      if (_serveOnce()) lFailuresInRow = 0;
     } catch (const QNCException& acrFailure) {
       // A failure of one connection's socket (a reset reported at the end of the stream, ...)
       // ends that connection, never the channel.
       QN_LOG_WARNING("Channel %u: connection dropped: %s", mChannelNo, acrFailure.what());
       mChannel.dropConnection();
-      // Failures with no success between them for 5 s are the channel's own (its listening
+      // Failures with no progress between them for 5 s are the channel's own (its listening
       // socket, the process's descriptors or memory), not a client's: the thread gives up, which
       // ends the run in order with exit status 1 for a supervisor to restart it. The pause keeps
       // a failing call from spinning meanwhile.
@@ -73,27 +72,29 @@ void QNCChannelWorker::run() {
   }
 }
 
-void QNCChannelWorker::_serveOnce() {
+bool QNCChannelWorker::_serveOnce() {
   const bool lActive = mSystem.getReader(mChannelNo)->waitForActivity(200);
   const unsigned long lGeneration = mChannel.getGeneration();
+  const bool lAccepted = lGeneration != mGeneration && lGeneration != 0;
   if (lGeneration != mGeneration) {  // a new connection (or none): its idle time starts now
     mGeneration = lGeneration;
     mLastProgress = std::chrono::steady_clock::now();
   }
-  if (lGeneration == 0) return;
+  if (lGeneration == 0) return false;
   if (!lActive) {
     if (mustGiveUp() && !isExitRequested()) {
       QN_LOG_WARNING("Channel %u: no message for %u s, connection dropped", mChannelNo,
                      static_cast<unsigned int>(mIdleLimit.count()));
       mChannel.dropConnection();
     }
-    return;
+    return lAccepted;
   }
   if (mChannel.atEndOfStream()) {
     mChannel.dropConnection();  // the client left between messages
-    return;
+    return true;
   }
   _handleMessage();
+  return true;
 }
 
 void QNCChannelWorker::_handleMessage() {

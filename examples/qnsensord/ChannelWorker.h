@@ -10,7 +10,7 @@
 //   the connection is dropped and the next client is taken;
 // - sending nothing, or stalling in the middle of a message: a connection that completes no
 //   message within the idle limit (the IdleLimit setting, seconds) is dropped.
-// A failure that persists with no success between for 5 s (poll or accept on the listening
+// A failure that persists with no progress between for 5 s (poll or accept on the listening
 // socket, no descriptor left, ...) is the channel's own: the thread then ends by that exception,
 // and the library's policy ends the run in order with exit status 1.
 // It looks at the exit request at least every 200 ms, also while it waits for the rest of a
@@ -36,7 +36,9 @@ class QNCChannelWorker : public QNCThreadComponent {
   void run() override;
 
  private:
-  void _serveOnce();
+  // One wait and what it brought; true when it made progress (a connection accepted, a message
+  // read or a client's end seen).
+  bool _serveOnce();
   void _handleMessage();
 
   QNCSensorSystem& mSystem;
