@@ -226,10 +226,10 @@ class QNCSystem : public QNCSystemInterface {
   // QNWS_Ready arElement holds the removed head, otherwise it is empty (its former object is
   // released on entry, before any lock). An element that is there already costs one pass through
   // the list's or queue's lock and none through the conditional's.
-  virtual QNEWaitStatus delistOrExit(unsigned int acConditionNo, unsigned int acListNo, unsigned int aMaxWaitMs,
-                                     QNCPointer<QNCQueueable>& arElement);
-  virtual QNEWaitStatus dequeueOrExit(unsigned int acConditionNo, unsigned int acQueueNo, unsigned int aMaxWaitMs,
-                                      QNCPointer<QNCQueueable>& arElement);
+  virtual QNEWaitStatus delistOrExit(unsigned int acConditionNo, unsigned int acListNo,
+                                     unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement);
+  virtual QNEWaitStatus dequeueOrExit(unsigned int acConditionNo, unsigned int acQueueNo,
+                                      unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement);
 
   // --- Non-virtual members.
   void checkCommandLine(int argc, char** argv, QNCString& aCommandLine);
