@@ -78,6 +78,7 @@ wait_end() {
 clean_after() {
   local dir=$1
   pgrep -f "QN_LOG_DIR=$dir" >/dev/null && return 1
+  mv "$dir/qnsensord.log" "$dir/first.log"  # the new instance's "running" line must be its own
   QN_LOG_DIR=$dir "$service" -D false -d 57 >"$dir/check.out" 2>&1 &
   local pid=$!
   for _ in $(seq 50); do grep -q "qnsensord running" "$dir/qnsensord.log" 2>/dev/null && break; sleep 0.1; done
