@@ -9,15 +9,22 @@ QNCPointer<QNCQueueable> QNCSynchQueue::front() {
 }
 
 QNCPointer<QNCQueueable> QNCSynchQueue::dequeue() {
+  QNCPointer<QNCQueueable> lHead;
+  if (!QNCSynchQueue::tryDequeue(lHead)) throw QNCNotFoundEx("Not Found", 8);
+  return lHead;
+}
+
+bool QNCSynchQueue::tryDequeue(QNCPointer<QNCQueueable>& arElement) {
   QNCList<QNCPointer<QNCQueueable>> lTaken;
   {
     QNCMutexLocker lGuard(mMutex);
-    if (mElements.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
+    if (mElements.isEmpty()) return false;
     // Unlinking the node costs neither an allocation nor counter traffic under the lock; the
     // node is freed when lTaken goes, after the lock.
     lTaken.spliceBack(mElements, mElements.begin());
   }
-  return std::move(lTaken.front());
+  arElement = std::move(lTaken.front());
+  return true;
 }
 
 void QNCSynchQueue::enqueue(const QNCPointer<QNCQueueable>& acrElement) {

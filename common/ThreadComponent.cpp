@@ -1,46 +1,29 @@
 #include "ThreadComponent.h"
 
 #include <chrono>
-#include <cstdio>
-#include <system_error>
 
 #include "Logger.h"
-#include "OsError.h"
 #include "QNException.h"
-
-namespace {
-// The component whose body runs on this thread. Tested before any lock is taken: a body that
-// waited for its own exit would otherwise block on the join lock its owner holds while joining.
-thread_local const QNCThreadComponent* gspCurrentComponent = nullptr;
-
-// Throws QNCInvalidEx "<apFormat with the component's name>".
-[[noreturn]] void throwInvalid(const char* apFormat, const QNCString& acrName) {
-  char lMessage[QNCException::kMaxMessage];
-  snprintf(lMessage, sizeof lMessage, apFormat, acrName.get());
-  throw QNCInvalidEx(lMessage, 6);
-}
-}  // namespace
+#include "RunStatus.h"
 
 QNCThreadComponent::QNCThreadComponent(const QNCString& acrName)
     : mName(acrName), mExitRequested(false), mStarted(false) {}
 
 QNCThreadComponent::~QNCThreadComponent() {
-  // Last resort only (see the header): a joinable std::thread destroyed would call terminate.
-  if (mThread.joinable()) {
-    {
-      std::lock_guard<std::mutex> lGuard(mLock);
-      mExitRequested = true;
-    }
-    mExitRequest.notify_all();
-    mThread.join();
+  // Last resort only (see the header): a thread still running is asked to end and joined (by
+  // mThreads' destructor) rather than left to std::terminate.
+  {
+    std::lock_guard<std::mutex> lGuard(mLock);
+    mExitRequested = true;
   }
+  mExitRequest.notify_all();
 }
 
 void QNCThreadComponent::requestExit() {
   QN_ENTERED();
   {
     std::lock_guard<std::mutex> lGuard(mLock);
-    if (!mStarted) throwInvalid("Thread '%s' was never started", mName);
+    if (!mStarted) QNThrowNamed<QNCInvalidEx>("Thread '%s' was never started", mName, 6);
     mExitRequested = true;
   }
   mExitRequest.notify_all();
@@ -49,21 +32,19 @@ void QNCThreadComponent::requestExit() {
 
 void QNCThreadComponent::init() {
   QN_ENTERED();
-  std::lock_guard<std::mutex> lJoinGuard(mJoinLock);
   {
     // Marked before the thread exists, so a body that asks itself to exit finds itself started.
     std::lock_guard<std::mutex> lGuard(mLock);
-    if (mStarted) throwInvalid("Thread '%s' already started", mName);
+    if (mStarted) QNThrowNamed<QNCInvalidEx>("Thread '%s' already started", mName, 6);
     mStarted = true;
   }
   try {
-    mThread = std::thread(&QNCThreadComponent::_body, this);
-  } catch (const std::system_error& acrError) {
-    {
-      std::lock_guard<std::mutex> lGuard(mLock);
-      mStarted = false;
-    }
-    OsThrowError<QNCOsException>(acrError.code().value(), "std::thread", mName.get());
+    mThreads.start(
+        1, [this] { _body(); }, [] {}, mName);
+  } catch (const QNCException&) {
+    std::lock_guard<std::mutex> lGuard(mLock);
+    mStarted = false;
+    throw;
   }
   QN_LEFT();
 }
@@ -75,9 +56,8 @@ bool QNCThreadComponent::isInited() const {
 
 void QNCThreadComponent::waitForExit() {
   QN_ENTERED();
-  if (gspCurrentComponent == this) throwInvalid("Thread '%s' cannot wait for its own exit", mName);
-  std::lock_guard<std::mutex> lJoinGuard(mJoinLock);
-  if (mThread.joinable()) mThread.join();
+  if (mThreads.isCurrent()) QNThrowNamed<QNCInvalidEx>("Thread '%s' cannot wait for its own exit", mName, 6);
+  mThreads.join();
   QN_LEFT();
 }
 
@@ -90,17 +70,33 @@ bool QNCThreadComponent::waitForExitRequest(unsigned int aMilliseconds) {
   std::unique_lock<std::mutex> lGuard(mLock);
   // The predicate form re-tests the flag after every wake-up, spurious ones included, and
   // before the first wait, so a request made before the call is never missed.
-  return mExitRequest.wait_for(lGuard, std::chrono::milliseconds(aMilliseconds), [this] { return mExitRequested; });
+  return mExitRequest.wait_for(lGuard, std::chrono::milliseconds(aMilliseconds),
+                               [this] { return mExitRequested; });
+}
+
+bool QNCThreadComponent::restartAfterFailure(const char*) {
+  QNFailRun();
+  return false;
 }
 
 void QNCThreadComponent::_body() {
   // Nothing may leave a thread function: an escaping exception would call std::terminate and
-  // take the whole service down for the fault of one thread. (The library never cancels
-  // threads, so no forced-unwind exception passes through the last clause.)
-  gspCurrentComponent = this;
-  try {
-    run();
-  } catch (...) {
-    QN_LOG_ERROR("Thread '%s' ended by an exception: %s", mName.get(), QNCurrentExceptionText());
+  // take the whole service down without its orderly exit. (The library never cancels threads,
+  // so no forced-unwind exception passes through the last clause.)
+  for (;;) {
+    try {
+      run();
+      return;
+    } catch (...) {
+      const char* const lpWhat = QNCurrentExceptionText();
+      QN_LOG_ERROR("Thread '%s' ended by an exception: %s", mName.get(), lpWhat);
+      try {
+        if (!restartAfterFailure(lpWhat) || isExitRequested()) return;
+      } catch (...) {
+        QN_LOG_ERROR("Thread '%s': its failure handling failed: %s", mName.get(), QNCurrentExceptionText());
+        return;
+      }
+    }
+    QN_LOG_NOTICE("Thread '%s' restarts its work", mName.get());
   }
 }

@@ -1,5 +1,7 @@
 #include "ServiceNotifier.h"
 
+#include "RunStatus.h"
+
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
@@ -53,7 +55,9 @@ void QNCServiceNotifier::notifyStopping() {
   send("STOPPING=1\nSTATUS=Stopping");
 }
 
-bool QNCServiceNotifier::isHealthy(const QNCSystem& acrSystem) { return !acrSystem.isSetForExit(); }
+bool QNCServiceNotifier::isHealthy(const QNCSystem& acrSystem) {
+  return !QNHasRunFailed() && !acrSystem.isSetForExit();
+}
 
 void QNCServiceNotifier::startWatchdog(QNCSystem* apSystem) {
   const char* lpAddress = getenv("NOTIFY_SOCKET");

@@ -15,8 +15,10 @@
 // be sent is logged as a warning (the watchdog's only once) and start-up goes on: a service
 // manager that does not hear READY=1 times the start out itself.
 //
-// Healthy (isHealthy): the exit request has not come. It is the one test the watchdog makes, so
-// a further condition of health belongs there. Once it fails the pings stop for good, and a
+// Healthy (isHealthy): the exit request has not come and no thread component or pool thread has
+// ended by an exception (hasRunFailed, SystemGlobals.h; a component that restarts its work after
+// a failure does not fail the run). It is the one test the watchdog makes, so a further condition
+// of health belongs there. Once it fails the pings stop for good, and a
 // service manager that still waits for the process ends it at the watchdog's time-out.
 //
 // The watchdog pings from a thread of its own, which startWatchdog() creates and stopWatchdog()

@@ -28,13 +28,20 @@ void QNCSynchList::enlistFront(const QNCPointer<QNCQueueable>& acrElement) {
 // The removed node is unlinked into a local list under the lock (no allocation, no counter
 // traffic) and its element moved out after the lock; the node is freed outside the lock too.
 QNCPointer<QNCQueueable> QNCSynchList::delist() {
+  QNCPointer<QNCQueueable> lHead;
+  if (!tryDelist(lHead)) throw QNCNotFoundEx("Not Found", 8);
+  return lHead;
+}
+
+bool QNCSynchList::tryDelist(QNCPointer<QNCQueueable>& arElement) {
   Elements lTaken;
   {
     QNCMutexLocker lGuard(*mMutex);
-    if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
+    if (mList.isEmpty()) return false;
     lTaken.spliceBack(mList, mList.begin());
   }
-  return std::move(lTaken.front());
+  arElement = std::move(lTaken.front());
+  return true;
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::delistBack() {

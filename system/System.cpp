@@ -158,6 +158,13 @@ void QNCSystem::makeThreadsToExit() {
   for (unsigned int lIndex = 0; lIndex < mThreadPools.numberOfElements(); ++lIndex) {
     mThreadPools[lIndex]->finish();
   }
+  // Wakes the exit-aware waits at once. Passing through each conditional's lock orders the wake-up
+  // after any waiter that tested the exit flag under it before the flag was set.
+  for (unsigned int lIndex = 0; lIndex < mWaitConditionals.numberOfElements(); ++lIndex) {
+    mWaitConditionals[lIndex]->lock();
+    mWaitConditionals[lIndex]->unlock();
+    mWaitConditionals[lIndex]->broadcast();
+  }
 }
 
 bool QNCSystem::isInited(unsigned int aIndex) const {

@@ -1,10 +1,14 @@
 #include "Assert.h"
-#include "Conditional.h"
+#include "ConditionalWait.h"
 #include "Logger.h"
 #include "QNException.h"
 #include "Reader.h"
 #include "System.h"
 #include "Writer.h"
+
+namespace {
+const auto kNever = [] { return false; };
+}  // namespace
 
 QNCPointer<QNCReader>& QNCSystem::getReader(unsigned int acReaderNo) {
   QN_ASSERT(acReaderNo < this->mReaders.numberOfElements());
@@ -31,44 +35,21 @@ void QNCSystem::signal(unsigned int acConditionNo) {
   QN_LEFT();
 }
 
+// wait and timedWait: one wait whatever the state, through the scaffold of ConditionalWait.h,
+// which gives the lock up before a time-out (QNCTimeOutEx) or any other failure leaves.
 void QNCSystem::wait(unsigned int acConditionNo) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
-  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
-  QN_LOG_TRACE("Locking the wait conditional");
-  lConditional.lock();
-  QN_LOG_TRACE("Going to wait on conditional");
-  try {
-    lConditional.wait();
-  } catch (...) {
-    // The wait holds the lock again when it fails; giving it up keeps the conditional usable.
-    QN_LOG_TRACE("Unlocking the wait conditional");
-    lConditional.unlock();
-    throw;
-  }
-  QN_LOG_TRACE("Unlocking the wait conditional");
-  lConditional.unlock();
+  QNWaitOnConditional(*mWaitConditionals[acConditionNo], kNever, kNever, -1, true,
+                      "Going to wait on conditional", __func__);
   QN_LEFT();
 }
 
 void QNCSystem::timedWait(unsigned int acConditionNo, unsigned int aWaitTime) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
-  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
-  QN_LOG_TRACE("Locking the wait conditional");
-  lConditional.lock();
-  QN_LOG_TRACE("Going to wait on conditional");
-  try {
-    lConditional.timedWait(aWaitTime);
-  } catch (...) {
-    // A time-out (QNCTimeOutEx) and any other failure of the wait come back with the lock
-    // held; it is given up before the exception leaves.
-    QN_LOG_TRACE("Unlocking the wait conditional");
-    lConditional.unlock();
-    throw;
-  }
-  QN_LOG_TRACE("Unlocking the wait conditional");
-  lConditional.unlock();
+  QNWaitOnConditional(*mWaitConditionals[acConditionNo], kNever, kNever, aWaitTime, true,
+                      "Going to wait on conditional", __func__);
   QN_LEFT();
 }
 

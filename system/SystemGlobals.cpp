@@ -11,6 +11,7 @@
 #include "OsService.h"
 #include "QNException.h"
 #include "QNString.h"
+#include "RunStatus.h"
 #include "ServiceNotifier.h"
 #include "SignalHandler.h"
 #include "System.h"
@@ -54,6 +55,8 @@ void handleSigHup(int) { requestExit(); }
 void setSystemObject(QNCSystem* apSystem) {
   QN_ASSERT(0UL != apSystem);
   gspSystem.store(apSystem);
+  // A thread that dies starts the orderly exit the way a signal does (RunStatus.h).
+  QNSetExitRequest(requestExit);
 }
 
 void getSystemObject(QNCSystem*& arpSystem) { arpSystem = gspSystem.load(); }
@@ -101,6 +104,9 @@ void SysInit(int argc, char** argv) {
   QN_LOG_TRACE("Creating the threads");
   lpSystem->createThreads();
   lpSystem->startThreads();
+  // A thread that died while later ones were still being started asked for an exit that those
+  // could not receive yet; asked again now, it reaches every thread.
+  if (QNHasRunFailed()) requestExit();
   lpSystem->postThreadsInit();
   RegisterSignalHandler(2, handleSigInt);
   RegisterSignalHandler(15, handleSigTerm);
@@ -134,6 +140,10 @@ void SysExit() {
   destroyLogger();
   QN_LEFT();
 }
+
+int getRunExitStatus() { return QNHasRunFailed() ? 1 : 0; }
+
+bool hasRunFailed() { return QNHasRunFailed(); }
 
 void SystemMain(int argc, char** argv) {
   QN_ENTERED();

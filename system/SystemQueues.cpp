@@ -1,74 +1,83 @@
+#include <exception>
+
 #include "Assert.h"
-#include "Conditional.h"
+#include "ConditionalWait.h"
 #include "Logger.h"
 #include "Queueable.h"
 #include "SynchList.h"
 #include "SynchQueue.h"
 #include "System.h"
 
+namespace {
+// Traces "Left" for the service it was made in when that service returns, and not when an
+// exception leaves it (as the services always did).
+class QNCLeftTrace {
+ public:
+  QNCLeftTrace(int aLine, const char* apFunction) : mLine(aLine), mpFunction(apFunction) {}
+  ~QNCLeftTrace() {
+    if (std::uncaught_exceptions() == mUncaught && QNIsLogLevelOn(QNLL_Trace))
+      PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", mLine, mpFunction, __FILE__, "%s", "Left");
+  }
+
+ private:
+  const int mUncaught = std::uncaught_exceptions();
+  const int mLine;
+  const char* mpFunction;
+};
+
+const auto kNever = [] { return false; };
+
+// The exit-aware waits take 0 for "no time limit"; the scaffold takes a negative limit.
+long long noLimitIfZero(unsigned int aMaxWaitMs) { return aMaxWaitMs == 0 ? -1 : aMaxWaitMs; }
+}  // namespace
+
+// The shape of every numbered list and queue service: trace "Entered", assert the number (the
+// assertion names the argument and the table, e.g. "acListNo < this->mLists.numberOfElements()"),
+// then lrElement is list or queue n and "Left" is traced on return. A macro, so that the trace
+// lines and the assertion keep naming the service itself.
+#define QN_NUMBERED(acNo, mTable) \
+  QN_ENTERED();                   \
+  QN_NUMBERED_AFTER_ENTRY(acNo, mTable)
+// The waits trace "Entered" and assert their conditional's number first.
+#define QN_NUMBERED_AFTER_ENTRY(acNo, mTable)        \
+  QN_ASSERT(acNo < this->mTable.numberOfElements()); \
+  auto& lrElement = *mTable[acNo];                   \
+  const QNCLeftTrace lLeftTrace(__LINE__, __func__)
+
 // --- Queues. The queue's own operations keep the element order and report its failures.
 
 void QNCSystem::waitOnEmptyQueue(unsigned int acConditionNo, unsigned int acQueueNo) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
-  QN_ASSERT(acQueueNo < this->mQueues.numberOfElements());
-  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
-  QNCSynchQueue& lQueue = *mQueues[acQueueNo];
-  QN_LOG_TRACE("Locking the wait conditional");
-  lConditional.lock();
-  try {
-    // The test runs under the conditional's lock, and signal() takes that lock, so an element
-    // enqueued and signalled after the test wakes this wait.
-    while (lQueue.isEmpty()) {
-      QN_LOG_TRACE("Queue empty... Going to wait on conditional");
-      lConditional.wait();
-    }
-  } catch (...) {
-    QN_LOG_TRACE("Unlocking the wait conditional");
-    lConditional.unlock();
-    throw;
-  }
-  QN_LOG_TRACE("Unlocking the wait conditional");
-  lConditional.unlock();
-  QN_LEFT();
+  QN_NUMBERED_AFTER_ENTRY(acQueueNo, mQueues);
+  QNWaitOnConditional(
+      *mWaitConditionals[acConditionNo], [&lrElement] { return !lrElement.isEmpty(); }, kNever, -1, false,
+      "Queue empty... Going to wait on conditional", __func__);
 }
 
 void QNCSystem::enqueue(unsigned int acQueueNo, const QNCPointer<QNCQueueable>& acrElement) {
-  QN_ENTERED();
-  QN_ASSERT(acQueueNo < this->mQueues.numberOfElements());
-  mQueues[acQueueNo]->enqueue(acrElement);
-  QN_LEFT();
+  QN_NUMBERED(acQueueNo, mQueues);
+  lrElement.enqueue(acrElement);
 }
 
 QNCPointer<QNCQueueable> QNCSystem::dequeue(unsigned int acQueueNo) {
-  QN_ENTERED();
-  QN_ASSERT(acQueueNo < this->mQueues.numberOfElements());
-  QNCPointer<QNCQueueable> lHead = mQueues[acQueueNo]->dequeue();
-  QN_LEFT();
-  return lHead;
+  QN_NUMBERED(acQueueNo, mQueues);
+  return lrElement.dequeue();
 }
 
 QNCPointer<QNCQueueable> QNCSystem::queueFront(unsigned int acQueueNo) {
-  QN_ENTERED();
-  QN_ASSERT(acQueueNo < this->mQueues.numberOfElements());
-  QNCPointer<QNCQueueable> lHead = mQueues[acQueueNo]->front();
-  QN_LEFT();
-  return lHead;
+  QN_NUMBERED(acQueueNo, mQueues);
+  return lrElement.front();
 }
 
 void QNCSystem::queueClear(unsigned int acQueueNo) {
-  QN_ENTERED();
-  QN_ASSERT(acQueueNo < this->mQueues.numberOfElements());
-  mQueues[acQueueNo]->clear();
-  QN_LEFT();
+  QN_NUMBERED(acQueueNo, mQueues);
+  lrElement.clear();
 }
 
 bool QNCSystem::isQueueEmpty(unsigned int acQueueNo) {
-  QN_ENTERED();
-  QN_ASSERT(acQueueNo < this->mQueues.numberOfElements());
-  const bool lEmpty = mQueues[acQueueNo]->isEmpty();
-  QN_LEFT();
-  return lEmpty;
+  QN_NUMBERED(acQueueNo, mQueues);
+  return lrElement.isEmpty();
 }
 
 // --- Lists. Each operation locks list n's mMutex inside QNCSynchList for its own duration.
@@ -76,123 +85,125 @@ bool QNCSystem::isQueueEmpty(unsigned int acQueueNo) {
 void QNCSystem::waitOnEmptyList(unsigned int acConditionNo, unsigned int acListNo) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
-  QNCSynchList& lList = *mLists[acListNo];
-  QN_LOG_TRACE("Locking the wait conditional");
-  lConditional.lock();
-  try {
-    // See waitOnEmptyQueue: the test and the wait are under the lock that signal() takes.
-    while (lList.isEmpty()) {
-      QN_LOG_TRACE("List empty... Going to wait on conditional");
-      lConditional.wait();
-    }
-  } catch (...) {
-    QN_LOG_TRACE("Unlocking the wait conditional");
-    lConditional.unlock();
-    throw;
-  }
-  QN_LOG_TRACE("Unlocking the wait conditional");
-  lConditional.unlock();
-  QN_LEFT();
+  QN_NUMBERED_AFTER_ENTRY(acListNo, mLists);
+  QNWaitOnConditional(
+      *mWaitConditionals[acConditionNo], [&lrElement] { return !lrElement.isEmpty(); }, kNever, -1, false,
+      "List empty... Going to wait on conditional", __func__);
 }
 
 void QNCSystem::enlist(unsigned int acListNo, const QNCPointer<QNCQueueable>& acrElement) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  mLists[acListNo]->enlist(acrElement);
-  QN_LEFT();
+  QN_NUMBERED(acListNo, mLists);
+  lrElement.enlist(acrElement);
 }
 
 void QNCSystem::enlistFront(unsigned int acListNo, const QNCPointer<QNCQueueable>& acrElement) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  mLists[acListNo]->enlistFront(acrElement);
-  QN_LEFT();
+  QN_NUMBERED(acListNo, mLists);
+  lrElement.enlistFront(acrElement);
 }
 
 QNCPointer<QNCQueueable> QNCSystem::delist(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  QNCPointer<QNCQueueable> lHead = mLists[acListNo]->delist();
-  QN_LEFT();
-  return lHead;
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.delist();
 }
 
 QNCPointer<QNCQueueable> QNCSystem::delistBack(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  QNCPointer<QNCQueueable> lTail = mLists[acListNo]->delistBack();
-  QN_LEFT();
-  return lTail;
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.delistBack();
 }
 
 QNCPointer<QNCQueueable> QNCSystem::listFront(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  QNCPointer<QNCQueueable> lHead = mLists[acListNo]->front();
-  QN_LEFT();
-  return lHead;
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.front();
 }
 
 void QNCSystem::listClear(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  mLists[acListNo]->clear();
-  QN_LEFT();
+  QN_NUMBERED(acListNo, mLists);
+  lrElement.clear();
 }
 
 unsigned int QNCSystem::listSize(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  const unsigned int lSize = mLists[acListNo]->numberOfElements();
-  QN_LEFT();
-  return lSize;
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.numberOfElements();
 }
 
 bool QNCSystem::isListEmpty(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  const bool lEmpty = mLists[acListNo]->isEmpty();
-  QN_LEFT();
-  return lEmpty;
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.isEmpty();
 }
 
 void QNCSystem::listErase(unsigned int acListNo, QNCQueueableList::iterator& arIterator) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  mLists[acListNo]->erase(arIterator);
-  QN_LEFT();
+  QN_NUMBERED(acListNo, mLists);
+  lrElement.erase(arIterator);
 }
 
 QNCQueueableList::const_iterator QNCSystem::listBegin(unsigned int acListNo) const {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  const QNCSynchList& lList = *mLists[acListNo];
-  QN_LEFT();
-  return lList.begin();
+  QN_NUMBERED(acListNo, mLists);
+  return static_cast<const QNCSynchList&>(lrElement).begin();
 }
 
 QNCQueueableList::const_iterator QNCSystem::listEnd(unsigned int acListNo) const {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  const QNCSynchList& lList = *mLists[acListNo];
-  QN_LEFT();
-  return lList.end();
+  QN_NUMBERED(acListNo, mLists);
+  return static_cast<const QNCSynchList&>(lrElement).end();
 }
 
 QNCQueueableList::iterator QNCSystem::listBegin(unsigned int acListNo) {
-  QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  QNCQueueableList::iterator lBegin = mLists[acListNo]->begin();
-  QN_LEFT();
-  return lBegin;
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.begin();
 }
 
 QNCQueueableList::iterator QNCSystem::listEnd(unsigned int acListNo) {
+  QN_NUMBERED(acListNo, mLists);
+  return lrElement.end();
+}
+
+// --- Exit-aware waits: the scaffold of ConditionalWait.h with the exit flag as the second test.
+
+QNEWaitStatus QNCSystem::waitOnEmptyListOrExit(unsigned int acConditionNo, unsigned int acListNo,
+                                               unsigned int aMaxWaitMs) {
   QN_ENTERED();
-  QN_ASSERT(acListNo < this->mLists.numberOfElements());
-  QNCQueueableList::iterator lEnd = mLists[acListNo]->end();
-  QN_LEFT();
-  return lEnd;
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QN_NUMBERED_AFTER_ENTRY(acListNo, mLists);
+  return QNWaitOnConditional(
+      *mWaitConditionals[acConditionNo], [&lrElement] { return !lrElement.isEmpty(); },
+      [this] { return isSetForExit(); }, noLimitIfZero(aMaxWaitMs), false,
+      "List empty... Going to wait on conditional", __func__);
+}
+
+QNEWaitStatus QNCSystem::waitOnEmptyQueueOrExit(unsigned int acConditionNo, unsigned int acQueueNo,
+                                                unsigned int aMaxWaitMs) {
+  QN_ENTERED();
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QN_NUMBERED_AFTER_ENTRY(acQueueNo, mQueues);
+  return QNWaitOnConditional(
+      *mWaitConditionals[acConditionNo], [&lrElement] { return !lrElement.isEmpty(); },
+      [this] { return isSetForExit(); }, noLimitIfZero(aMaxWaitMs), false,
+      "Queue empty... Going to wait on conditional", __func__);
+}
+
+QNEWaitStatus QNCSystem::delistOrExit(unsigned int acConditionNo, unsigned int acListNo,
+                                      unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement) {
+  QN_ENTERED();
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QN_NUMBERED_AFTER_ENTRY(acListNo, mLists);
+  arElement.reset();
+  // The busy case first: one pass through the list's lock. Otherwise the take is the test itself,
+  // made under the conditional's lock, so no other consumer comes between the test and the take.
+  if (lrElement.tryDelist(arElement)) return QNWS_Ready;
+  return QNWaitOnConditional(
+      *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDelist(arElement); },
+      [this] { return isSetForExit(); }, noLimitIfZero(aMaxWaitMs), false,
+      "List empty... Going to wait on conditional", __func__);
+}
+
+QNEWaitStatus QNCSystem::dequeueOrExit(unsigned int acConditionNo, unsigned int acQueueNo,
+                                       unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement) {
+  QN_ENTERED();
+  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
+  QN_NUMBERED_AFTER_ENTRY(acQueueNo, mQueues);
+  arElement.reset();
+  if (lrElement.tryDequeue(arElement)) return QNWS_Ready;
+  return QNWaitOnConditional(
+      *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDequeue(arElement); },
+      [this] { return isSetForExit(); }, noLimitIfZero(aMaxWaitMs), false,
+      "Queue empty... Going to wait on conditional", __func__);
 }

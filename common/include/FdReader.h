@@ -28,17 +28,29 @@ class QNCFdReader : public QNCReader {
   // descriptor cannot be made non-blocking.
   explicit QNCFdReader(int aFd, bool aOwnsFd = true, unsigned int aStagingSize = kDefaultStagingSize,
                        unsigned int aReadWaitMs = 0);
+  // Never throws: a failing close(2) of an owned descriptor is ignored (the descriptor is gone).
   ~QNCFdReader() override;
   QNCFdReader(const QNCFdReader&) = delete;
   QNCFdReader& operator=(const QNCFdReader&) = delete;
 
-  // Delivers up to arBuffer->getLength() bytes into the buffer, from its first byte on.
+  // Delivers up to arBuffer->getLength() bytes into the buffer, from its first byte on; 0 bytes
+  // (no exception) at the end of the stream. Throws:
+  // - QNCTryAgainEx "Resource temporarily unavailable" (11) when nothing has arrived (after the
+  //   read wait, if any);
+  // - QNCReadFailedEx "read fd <n>: <system text>" (errno) when read(2) fails otherwise, e.g.
+  //   ECONNRESET when the peer closed a socket with bytes of ours still unread;
+  // - QNCOsException "poll fd <n>: <system text>" when the read wait's poll(2) fails.
+  // Never throws for EINTR (retried).
   void read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount) override;
+  // Throws QNCOsException "poll fd <n>: <system text>" when poll(2) fails (EINTR is retried for the
+  // time that is left).
   bool waitForActivity(unsigned int acWaitTime) override;
 
   // True when the peer has closed the stream and every byte has been delivered; never blocks.
   // Lets a server tell a client that left between messages (not an error) from one that left in
-  // the middle of a message.
+  // the middle of a message. It reads ahead to find out, so it throws what read(2) reports:
+  // QNCReadFailedEx "read fd <n>: <system text>" (ECONNRESET after a peer closed with our bytes
+  // unread, among others). Never QNCTryAgainEx: nothing to read yet is false.
   bool atEndOfStream();
 
  private:

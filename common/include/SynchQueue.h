@@ -45,6 +45,10 @@ class QNCSynchQueue {
   // given up.
   virtual void clear();
 
+  // dequeue() without the exception: false (arElement unchanged) when the queue is empty. One
+  // pass through the lock, no allocation; arElement's former object is released after the lock.
+  virtual bool tryDequeue(QNCPointer<QNCQueueable>& arElement);
+
  private:
   QNCMutex mMutex;  // guards mElements
   QNCList<QNCPointer<QNCQueueable>> mElements;

@@ -7,14 +7,19 @@
 // by sleeping in waitForExitRequest(), which the request interrupts at once: a body never has
 // to poll faster than its own work needs.
 //
-// An exception that escapes run() ends the thread, not the process: it is logged at error level
-// "Thread '<name>' ended by an exception: <message>" and waitForExit() returns as for a normal
-// end. (Without this, an exception leaving a thread function calls std::terminate.)
+// A thread that dies is never forgotten. An exception that escapes run() is logged at error level
+// "Thread '<name>' ended by an exception: <message>", then restartAfterFailure() decides. By
+// default the run is marked failed and the orderly exit of the whole service starts
+// (QNFailRun(), RunStatus.h: the system object's makeThreadsToExit), so the service does not
+// run on degraded: SystemMain returns normally and getRunExitStatus() gives main the status 1 for
+// a supervisor to act on. A component that can recover overrides the hook to run run() again.
+// (An exception leaving a thread function would otherwise call std::terminate.)
 //
 // Threads: init() and waitForExit() are for the owner (the main thread in the system's
 // lifecycle); requestExit(), isExitRequested() and isInited() may be called from any thread at
 // any time, also concurrently with each other. mLock guards mExitRequested and mStarted only and
-// is never held while the body or a virtual operation runs.
+// is never held while the body or a virtual operation runs. mThreads keeps the thread and its
+// join lock (ThreadGroup.h).
 //
 // Lifetime: the owner joins the thread (waitForExit) before the object is destroyed. As a last
 // resort the destructor requests exit and joins a thread that is still running, so the process
@@ -24,9 +29,9 @@
 
 #include <condition_variable>
 #include <mutex>
-#include <thread>
 
 #include "QNString.h"
+#include "ThreadGroup.h"
 
 class QNCThreadComponent {
  public:
@@ -68,6 +73,15 @@ class QNCThreadComponent {
   // when the request came before the call. Spurious wake-ups are absorbed.
   bool waitForExitRequest(unsigned int aMilliseconds);
 
+  // Called on the component's thread after run() ended by the exception whose text is apWhat
+  // (already logged at error level). Returns true to run run() again: the restart then happens
+  // unless exit has been requested meanwhile, and is logged at notice level "Thread '<name>'
+  // restarts its work". The default marks the run failed and starts the orderly exit
+  // (QNFailRun()), then returns false so the thread ends. An override that restarts bounds its
+  // restarts itself (a body that fails at once would otherwise spin), and may call the base to
+  // give up.
+  virtual bool restartAfterFailure(const char* apWhat);
+
  private:
   void _body();
 
@@ -76,6 +90,5 @@ class QNCThreadComponent {
   std::condition_variable mExitRequest;
   bool mExitRequested;
   bool mStarted;
-  std::mutex mJoinLock;  // guards mThread: one joiner at a time
-  std::thread mThread;
+  QNCThreadGroup mThreads;  // the one thread; declared last, so it is joined first
 };

@@ -12,12 +12,17 @@
 // - A submission after finish() is refused with QNCExitConditionEx
 //   "ThreadPool '<name>' is finished: task refused"; a task is never dropped silently.
 // - Tasks submitted before init() wait in the queue and run once the workers start.
-// - A task that throws is logged at error level "ThreadPool '<name>': task failed: <message>"
-//   and its worker goes on with the next task; the process does not end.
+// - A task that throws is logged at error level "ThreadPool '<name>': task failed: <message>",
+//   then onTaskFailure() decides. By default the failure is that of the run, as for a thread
+//   component that dies (ThreadComponent.h): the run is marked failed and the orderly exit starts
+//   (QNFailRun(), RunStatus.h), and getRunExitStatus() later gives main the status 1. The worker
+//   itself goes on, so the queue still drains. A pool whose tasks may fail overrides the hook
+//   (to resubmit, count or ignore the failure).
 //
 // Threads: submit(), finish() and getName() may be called from any thread, also from a task and
 // from the signal dispatcher; finish() never blocks. init() and waitForThreads() are for the
-// owner. mLock guards mTasks, mFinished, mStarted and is never held while a task runs.
+// owner. mLock guards mTasks, mFinished, mStarted and is never held while a task runs; mThreads
+// keeps the workers and their join lock (ThreadGroup.h).
 //
 // Lifetime: the owner calls finish() and waitForThreads() before destroying the pool; the
 // destructor does both if they were not done, so the process never reaches std::terminate.
@@ -26,10 +31,9 @@
 #include <deque>
 #include <functional>
 #include <mutex>
-#include <thread>
-#include <vector>
 
 #include "QNString.h"
+#include "ThreadGroup.h"
 
 class QNCThreadPool {
  public:
@@ -61,10 +65,14 @@ class QNCThreadPool {
   virtual void submit(QNTTask aTask);
 
   QNCString& getName() { return mName; }
-  unsigned int getThreadCount() const { return mThreadCount; }
+
+ protected:
+  // Called on the worker after a task threw the exception whose text is apWhat (already logged
+  // at error level). The default marks the run failed and starts the orderly exit (QNFailRun()).
+  // The worker takes the next task whatever the hook does.
+  virtual void onTaskFailure(const char* apWhat);
 
  private:
-  void _abandonStart();
   void _work();
   void _run(QNTTask& arTask);
 
@@ -75,6 +83,5 @@ class QNCThreadPool {
   std::deque<QNTTask> mTasks;
   bool mFinished;
   bool mStarted;
-  std::mutex mJoinLock;  // guards mWorkers: one starter or joiner at a time
-  std::vector<std::thread> mWorkers;
+  QNCThreadGroup mThreads;  // the workers; declared last, so they are joined first
 };

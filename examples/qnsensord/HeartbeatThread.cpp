@@ -7,7 +7,10 @@
 
 QNCHeartbeatThread::QNCHeartbeatThread(QNCSensorSystem& arSystem, const QNCSensorStatistics& acrStatistics,
                                        unsigned int aPeriod)
-    : QNCThreadComponent("Heartbeat"), mSystem(arSystem), mStatistics(acrStatistics), mPeriod(aPeriod < 1 ? 1 : aPeriod) {}
+    : QNCThreadComponent("Heartbeat"),
+      mSystem(arSystem),
+      mStatistics(acrStatistics),
+      mPeriod(aPeriod < 1 ? 1 : aPeriod) {}
 
 void QNCHeartbeatThread::run() {
   try {

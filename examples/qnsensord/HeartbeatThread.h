@@ -11,7 +11,8 @@ class QNCSensorSystem;
 
 class QNCHeartbeatThread : public QNCThreadComponent {
  public:
-  QNCHeartbeatThread(QNCSensorSystem& arSystem, const QNCSensorStatistics& acrStatistics, unsigned int aPeriod);
+  QNCHeartbeatThread(QNCSensorSystem& arSystem, const QNCSensorStatistics& acrStatistics,
+                     unsigned int aPeriod);
 
  protected:
   void run() override;

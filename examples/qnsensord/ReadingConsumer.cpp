@@ -16,34 +16,38 @@
 
 QNCReadingConsumer::QNCReadingConsumer(QNCSensorSystem& arSystem, QNCSensorStatistics& arStatistics,
                                        const QNCPointer<QNCThreadPool>& acrReporters)
-    : QNCThreadComponent("ReadingConsumer"), mSystem(arSystem), mStatistics(arStatistics), mReporters(acrReporters) {}
+    : QNCThreadComponent("ReadingConsumer"),
+      mSystem(arSystem),
+      mStatistics(arStatistics),
+      mReporters(acrReporters) {}
 
 void QNCReadingConsumer::run() {
-  while (mSystem.waitForReadings()) {
-    QNCPointer<QNCQueueable> lElement;
-    try {
-      lElement = mSystem.delist(QNCSensorSystem::kReadingList);
-    } catch (const QNCNotFoundEx&) {
-      continue;  // only this thread delists, but an empty list is no reason to stop
-    }
+  QNCPointer<QNCQueueable> lElement;
+  // Ends once the process is marked for exit and every reading handed over has been answered;
+  // the exit request wakes the wait at once.
+  while (mSystem.delistOrExit(QNCSensorSystem::kReadingsReady, QNCSensorSystem::kReadingList, 0, lElement) ==
+         QNWS_Ready) {
     QNCSensorReadingItem& lItem = static_cast<QNCSensorReadingItem&>(*lElement);
+    const bool lHadId = lItem.mAccepted;
     _answer(lItem);
-    if (lItem.mAccepted) {
-      mSystem.returnNumericId(lItem.mId);
-      if (mStatistics.total() % 5000 == 0) _report();
-    }
+    if (lHadId) mSystem.returnNumericId(lItem.mId);
+    if (lItem.mAccepted && mStatistics.total() % 5000 == 0) _report();
   }
 }
 
 void QNCReadingConsumer::_answer(QNCSensorReadingItem& arItem) {
-  if (arItem.mAccepted) mStatistics.add(arItem.mReading.mSensor, arItem.mReading.mValue);
+  if (arItem.mAccepted && !mStatistics.add(arItem.mReading.mSensor, arItem.mReading.mValue)) {
+    arItem.mAccepted = false;
+    arItem.mReason = "too many sensors";
+  }
   char lText[128];
-  const int lLength =
-      arItem.mAccepted
-          ? ClibSnprintf(lText, sizeof lText, "OK %s %u", arItem.mSequenceText.c_str(), arItem.mId)
-          : ClibSnprintf(lText, sizeof lText, "ERR %s %s", arItem.mSequenceText.c_str(), arItem.mReason.c_str());
-  const unsigned int lSize = lLength < static_cast<int>(sizeof lText) ? static_cast<unsigned int>(lLength)
-                                                                        : static_cast<unsigned int>(sizeof lText - 1);
+  const int lLength = arItem.mAccepted ? ClibSnprintf(lText, sizeof lText, "OK %s %u",
+                                                      arItem.mSequenceText.c_str(), arItem.mId)
+                                       : ClibSnprintf(lText, sizeof lText, "ERR %s %s",
+                                                      arItem.mSequenceText.c_str(), arItem.mReason.c_str());
+  const unsigned int lSize = lLength < static_cast<int>(sizeof lText)
+                                 ? static_cast<unsigned int>(lLength)
+                                 : static_cast<unsigned int>(sizeof lText - 1);
   QNCPointer<QNCBuffer> lAnswer;
   mSystem.getBuffer(lSize, lAnswer);
   ClibMemcpy(static_cast<unsigned char*>(*lAnswer), lText, lSize);

@@ -113,9 +113,17 @@ bool QNCSensorChannel::waitForActivity(unsigned int aMilliseconds) {
   if (!lReader.isNull()) return lReader->waitForActivity(aMilliseconds);
 
   struct pollfd lPoll = {mListenFd, POLLIN, 0};
-  if (poll(&lPoll, 1, static_cast<int>(aMilliseconds)) <= 0) return false;
+  const int lReady = poll(&lPoll, 1, static_cast<int>(aMilliseconds));
+  if (lReady < 0 && errno != EINTR) throwSocketError("poll", mPath);  // else the caller would spin
+  if (lReady <= 0) return false;
   const int lFd = accept4(mListenFd, nullptr, nullptr, SOCK_CLOEXEC);
-  if (lFd < 0) return false;  // the client gave up before it was accepted
+  if (lFd < 0) {
+    // The client gave up before it was accepted: nothing lost. Anything else (no descriptor or
+    // memory left) is the service's own trouble and must not pass as an idle channel.
+    if (errno == EAGAIN || errno == EWOULDBLOCK || errno == ECONNABORTED || errno == EINTR || errno == EPROTO)
+      return false;
+    throwSocketError("accept", mPath);
+  }
   const int lWriteFd = dup(lFd);
   if (lWriteFd < 0) {
     close(lFd);
@@ -125,7 +133,7 @@ bool QNCSensorChannel::waitForActivity(unsigned int aMilliseconds) {
   QNCPointer<QNCFdReader> lNewReader(new (std::nothrow)
                                          QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
                                      QNPST_Individual, QNPAT_New);
-  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, 5000), QNPST_Individual,
+  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, kAnswerDrainMs), QNPST_Individual,
                                      QNPAT_New);
   QNCMutexLocker lGuard(mLock);
   mReader = lNewReader;
@@ -158,9 +166,21 @@ void QNCSensorChannel::read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCou
 
 bool QNCSensorChannel::writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer,
                                       unsigned int& arCount) {
+  QNCPointer<QNCFdReader> lReader;  // declared before the guard: released after the lock
+  QNCPointer<QNCFdWriter> lWriter;
   QNCMutexLocker lGuard(mLock);
   if (mWriter.isNull() || mGeneration != acGeneration) return false;
-  mWriter->write(acrBuffer, arCount);
+  try {
+    mWriter->write(acrBuffer, arCount);
+  } catch (const QNCTimeOutEx&) {
+    // A client that leaves its answers unread: its connection ends here, so no later answer,
+    // for this client or any other, waits on it again.
+    QN_LOG_INFO("Channel %s: connection %lu ended", mPath.c_str(), mGeneration);
+    lReader = std::move(mReader);
+    lWriter = std::move(mWriter);
+    mGeneration = 0;
+    throw;
+  }
   return true;
 }
 

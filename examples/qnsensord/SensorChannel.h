@@ -24,6 +24,10 @@
 
 class QNCSensorChannel {
  public:
+  // How long an answer may wait for its client to drain the socket (whose buffer holds a few
+  // hundred answers) before the connection is ended.
+  static constexpr unsigned int kAnswerDrainMs = 100;
+
   // Owner read and write, group read and write: the service's group may feed readings, others
   // may not even connect. Set explicitly, so the umask (0 in a daemon) plays no part.
   static constexpr unsigned int kSocketMode = 0660;
@@ -41,6 +45,8 @@ class QNCSensorChannel {
 
   // Waits at most aMilliseconds. Without a connection, accepts one that is waiting. Returns true
   // when the current connection has bytes to read or has ended.
+  // Throws QNCOpenFailedEx naming the path when poll or accept on the listening socket fails for
+  // a reason other than a client that gave up (no descriptor or memory left, ...).
   bool waitForActivity(unsigned int aMilliseconds);
 
   // True when the current connection's client has closed it and every byte has been read.
@@ -50,9 +56,9 @@ class QNCSensorChannel {
   void read(QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
 
   // Writes to the current connection if it is still generation acGeneration; returns false (and
-  // writes nothing) when that connection has ended.
-  bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer,
-                      unsigned int& arCount);
+  // writes nothing) when that connection has ended. A client whose socket stays full for
+  // kAnswerDrainMs loses its connection: QNCTimeOutEx, and the connection is ended.
+  bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount);
 
   // Ends the current connection (after the end of its stream, or a message that failed).
   void dropConnection();

@@ -16,6 +16,6 @@ class QNCSensorReadingItem : public QNCQueueable {
   bool mAccepted = false;
   QNSSensorReading mReading;
   std::string mSequenceText;
-  unsigned int mId = 0;      // when accepted
-  std::string mReason;       // when refused
+  unsigned int mId = 0;  // when accepted
+  std::string mReason;   // when refused
 };

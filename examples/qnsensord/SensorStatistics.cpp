@@ -1,13 +1,19 @@
 #include "SensorStatistics.h"
 
-void QNCSensorStatistics::add(const std::string& acrSensor, double aValue) {
+bool QNCSensorStatistics::add(const std::string& acrSensor, double aValue) {
   std::lock_guard<std::mutex> lGuard(mLock);
-  QNSSensorSummary& lSummary = mSensors[acrSensor];
+  auto lEntry = mSensors.find(acrSensor);
+  if (lEntry == mSensors.end()) {
+    if (mSensors.size() >= kMaxSensors) return false;
+    lEntry = mSensors.emplace(acrSensor, QNSSensorSummary()).first;
+  }
+  QNSSensorSummary& lSummary = lEntry->second;
   if (lSummary.mCount == 0 || aValue < lSummary.mMin) lSummary.mMin = aValue;
   if (lSummary.mCount == 0 || aValue > lSummary.mMax) lSummary.mMax = aValue;
   lSummary.mSum += aValue;
   ++lSummary.mCount;
   ++mTotal;
+  return true;
 }
 
 std::map<std::string, QNSSensorSummary> QNCSensorStatistics::snapshot() const {

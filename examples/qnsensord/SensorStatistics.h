@@ -1,5 +1,7 @@
 #pragma once
-// QNCSensorStatistics: running statistics per sensor (count, minimum, maximum, mean).
+// QNCSensorStatistics: running statistics per sensor (count, minimum, maximum, mean) for at most
+// kMaxSensors sensors: a peer that invents names cannot make the table, nor the statistics logged
+// at shut-down, grow without bound.
 // Threads: any thread; one lock guards the table. snapshot() copies it for reporting.
 
 #include <map>
@@ -16,7 +18,11 @@ struct QNSSensorSummary {
 
 class QNCSensorStatistics {
  public:
-  void add(const std::string& acrSensor, double aValue);
+  static constexpr unsigned int kMaxSensors = 1024;
+
+  // Adds a value of a sensor already tracked, or of a new one while fewer than kMaxSensors are
+  // tracked; returns false (and adds nothing) for a new sensor when the table is full.
+  bool add(const std::string& acrSensor, double aValue);
   std::map<std::string, QNSSensorSummary> snapshot() const;
   unsigned long total() const;
 

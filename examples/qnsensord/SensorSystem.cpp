@@ -27,11 +27,13 @@ const QNSCommandLineArgumentDesc kOptions[] = {
     {"-h", 0, "", "print this help, then exit"},
     {"-s", 0, "", "stop the running qnsensord, then exit"},
     {"-c", 1, "file", "take DebugLevel, HbTimeout, Daemonize from a key = value file; -d -b -D -I unused"},
-    {"-d", 1, "mask", "log levels: sum of 1 halt 8 error 16 warning 32 notice 64 info 128 trace (default 255)"},
+    {"-d", 1, "mask",
+     "log levels: sum of 1 halt 8 error 16 warning 32 notice 64 info 128 trace (default 255)"},
     {"-b", 1, "seconds", "heartbeat time-out for the watchdog (default 30)"},
     {"-D", 1, "true|false", "true runs in the background as a daemon, anything else in front (default true)"},
     {"-I", 1, "minutes", "database reopen interval; 0 or less never reopens (default 15)"},
     {"-n", 1, "count", "number of sensor channels, 1 to 64 (default 2); not with -c"},
+    {"-t", 1, "seconds", "drop a connection that completes no message for this long, 1 to 3600 (default 60)"},
 };
 
 // Decodes acrText as the kind aValue holds, or throws QNCInvalidEx "<file>:<line>: <key>: ...".
@@ -40,13 +42,14 @@ void decodeSetting(const QNCKeyValueFormatParser& acrParser, const char* apKey, 
     arValue.decode(acrParser.getValue(apKey));
   } catch (const QNCInvalidEx& acrException) {
     char lMessage[QNCException::kMaxMessage];
-    snprintf(lMessage, sizeof lMessage, "%s:%u: %s: %s", acrParser.getFilePath().get(), acrParser.getLine(apKey),
-             apKey, acrException.what());
+    snprintf(lMessage, sizeof lMessage, "%s:%u: %s: %s", acrParser.getFilePath().get(),
+             acrParser.getLine(apKey), apKey, acrException.what());
     throw QNCInvalidEx(lMessage, 6);
   }
 }
 
-[[noreturn]] void throwBadValue(const QNCKeyValueFormatParser& acrParser, const char* apKey, const char* apExpected) {
+[[noreturn]] void throwBadValue(const QNCKeyValueFormatParser& acrParser, const char* apKey,
+                                const char* apExpected) {
   char lMessage[QNCException::kMaxMessage];
   snprintf(lMessage, sizeof lMessage, "%s:%u: %s expects %s, got '%s'", acrParser.getFilePath().get(),
            acrParser.getLine(apKey), apKey, apExpected, acrParser.getValue(apKey).get());
@@ -104,12 +107,37 @@ void QNCSensorSystem::processCommandLine(int argc, char** argv) {
       }
       _addChannelCount(lCount);
     }
+    _processIdleLimit();
   } catch (const QNCUsageEx&) {
     throw;
   } catch (const QNCInvalidEx& acrException) {
     throw QNCUsageEx(acrException.what(), acrException.getCode());
   }
   QN_LEFT();
+}
+
+void QNCSensorSystem::_processIdleLimit() {
+  QNCPointer<QNCCommandLineArgument> lArgument;
+  try {
+    mCommandLineParser->getArgument("-t", lArgument);
+  } catch (QNCNotFoundEx&) {
+    return;  // the default stays
+  }
+  QNCOptionValueArgument* lpArg = dynamic_cast<QNCOptionValueArgument*>(lArgument.get());
+  QN_ASSERT(NULL != lpArg);
+  QNCMultiType lSeconds(0u);
+  try {
+    lSeconds.decode(lpArg->getValue());
+  } catch (const QNCInvalidEx&) {
+    lSeconds.set(0u);  // not a number: reported below like any value out of range
+  }
+  if (static_cast<unsigned int>(lSeconds) < 1 || static_cast<unsigned int>(lSeconds) > 3600) {
+    char lMessage[QNCException::kMaxMessage];
+    snprintf(lMessage, sizeof lMessage, "Option '-t' expects seconds from 1 to 3600, got '%s'",
+             lpArg->getValue().get());
+    throw QNCInvalidEx(lMessage, 6);
+  }
+  mIdleLimit = lSeconds;
 }
 
 void QNCSensorSystem::setCommandLineArgumentDesc() {
@@ -119,7 +147,8 @@ void QNCSensorSystem::setCommandLineArgumentDesc() {
 void QNCSensorSystem::parseConfigFile(QNCString&) {
   QN_ENTERED();
   QNCPointer<QNCMultiType> lPath;
-  if (!mSettings.contains("ConfigFile")) throw QNCNotImplementedEx("qnsensord reads a configuration file only with -c", 0);
+  if (!mSettings.contains("ConfigFile"))
+    throw QNCNotImplementedEx("qnsensord reads a configuration file only with -c", 0);
   getSetting("ConfigFile", lPath);
   QN_LOG_NOTICE("Reading configuration file %s", lPath->getText().get());
   mConfigFileParser->parse(lPath->getText());
@@ -129,8 +158,8 @@ void QNCSensorSystem::parseConfigFile(QNCString&) {
   mConfigFileParser->getKeys(lKeys);
   for (unsigned int lIndex = 0; lIndex < lKeys.numberOfElements(); ++lIndex) {
     const char* lpKey = lKeys[lIndex].get();
-    if (strcmp(lpKey, "DebugLevel") != 0 && strcmp(lpKey, "HbTimeout") != 0 && strcmp(lpKey, "Daemonize") != 0 &&
-        strcmp(lpKey, "ChannelCount") != 0) {
+    if (strcmp(lpKey, "DebugLevel") != 0 && strcmp(lpKey, "HbTimeout") != 0 &&
+        strcmp(lpKey, "Daemonize") != 0 && strcmp(lpKey, "ChannelCount") != 0) {
       char lMessage[QNCException::kMaxMessage];
       snprintf(lMessage, sizeof lMessage,
                "%s:%u: unknown key '%s' (qnsensord knows DebugLevel, HbTimeout, Daemonize, ChannelCount)",
@@ -141,7 +170,8 @@ void QNCSensorSystem::parseConfigFile(QNCString&) {
   for (const char* lpRequired : {"DebugLevel", "HbTimeout", "Daemonize"}) {
     if (!mConfigFileParser->hasKey(lpRequired)) {
       char lMessage[QNCException::kMaxMessage];
-      snprintf(lMessage, sizeof lMessage, "%s: '%s' is not set (qnsensord needs DebugLevel, HbTimeout and Daemonize)",
+      snprintf(lMessage, sizeof lMessage,
+               "%s: '%s' is not set (qnsensord needs DebugLevel, HbTimeout and Daemonize)",
                mConfigFileParser->getFilePath().get(), lpRequired);
       throw QNCNotFoundEx(lMessage, 8);
     }
@@ -157,12 +187,16 @@ void QNCSensorSystem::parseConfigFile(QNCString&) {
   QNCMultiType lChannelCount(kDefaultChannelCount);
   if (mConfigFileParser->hasKey("ChannelCount")) {
     decodeSetting(*mConfigFileParser, "ChannelCount", lChannelCount);
-    if (!isChannelCount(lChannelCount)) throwBadValue(*mConfigFileParser, "ChannelCount", "a count from 1 to 64");
+    if (!isChannelCount(lChannelCount))
+      throwBadValue(*mConfigFileParser, "ChannelCount", "a count from 1 to 64");
   }
 
-  addSetting("DebugLevel", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lDebugLevel), QNPST_Individual, QNPAT_New));
-  addSetting("HbTimeout", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lHbTimeout), QNPST_Individual, QNPAT_New));
-  addSetting("Daemonize", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lDaemonize), QNPST_Individual, QNPAT_New));
+  addSetting("DebugLevel", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lDebugLevel),
+                                                    QNPST_Individual, QNPAT_New));
+  addSetting("HbTimeout", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lHbTimeout),
+                                                   QNPST_Individual, QNPAT_New));
+  addSetting("Daemonize", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lDaemonize),
+                                                   QNPST_Individual, QNPAT_New));
   _addChannelCount(lChannelCount);
   QN_LEFT();
 }
@@ -198,5 +232,6 @@ unsigned int QNCSensorSystem::getChannelCount() {
 
 void QNCSensorSystem::_addChannelCount(unsigned int aCount) {
   QN_LOG_NOTICE("Using %u sensor channels", aCount);
-  addSetting("ChannelCount", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(aCount), QNPST_Individual, QNPAT_New));
+  addSetting("ChannelCount",
+             QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(aCount), QNPST_Individual, QNPAT_New));
 }

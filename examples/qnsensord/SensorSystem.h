@@ -3,7 +3,8 @@
 //
 // Configuration comes from one of two places, never both:
 // - the command line: the library's eight common options plus "-n <count>", the number of
-//   sensor channels (1 to 64, default 2);
+//   sensor channels (1 to 64, default 2), and "-t <seconds>", the idle limit of a connection
+//   (1 to 3600, default 60; also with -c);
 // - with "-c <file>", a key = value file (see examples/qnsensord.conf) that must set DebugLevel,
 //   HbTimeout and Daemonize and may set ChannelCount; the other command-line options are then
 //   ignored by the library, and "-n" is refused.
@@ -45,10 +46,6 @@ class QNCSensorSystem : public QNCSystem {
   // now end the service in order (before this line they have their default effect).
   void createStartUpEvent() override;
 
-  // Blocks until list kReadingList holds a reading (true) or the process is marked for exit and
-  // the list is empty (false).
-  bool waitForReadings();
-
   static constexpr unsigned int kReadingsReady = 0;  // the conditional the consumer waits on
   static constexpr unsigned int kReadingList = 0;    // the list of readings to answer
 
@@ -60,7 +57,9 @@ class QNCSensorSystem : public QNCSystem {
 
  private:
   void _addChannelCount(unsigned int aCount);
+  void _processIdleLimit();
 
   QNCVector<QNCPointer<QNCSensorChannel>> mChannels;
   QNCSensorStatistics mStatistics;
+  unsigned int mIdleLimit = 60;  // seconds a connection may complete no message (-t)
 };

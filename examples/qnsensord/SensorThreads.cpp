@@ -10,8 +10,8 @@
 
 #include <string>
 
-#include "Conditional.h"
 #include "ChannelWorker.h"
+#include "Conditional.h"
 #include "HeartbeatThread.h"
 #include "Logger.h"
 #include "MultiType.h"
@@ -31,32 +31,36 @@ void QNCSensorSystem::init() {
   QN_ENTERED();
   // Readings and answers are short: a peer that announces more than 4 KiB is refused before
   // anything is allocated.
-  mProtocolHelper =
-      QNCPointer<QNCProtocolHelper>(new (std::nothrow) QNCProtocolHelper(100, 4096), QNPST_Individual, QNPAT_New);
+  mProtocolHelper = QNCPointer<QNCProtocolHelper>(new (std::nothrow) QNCProtocolHelper(100, 4096),
+                                                  QNPST_Individual, QNPAT_New);
   QNCString lDir;
   getLogDir(lDir);
   const unsigned int lChannelCount = getChannelCount();
   for (unsigned int lChannelNo = 0; lChannelNo < lChannelCount; ++lChannelNo) {
     const std::string lPath = std::string(lDir.get()) + "/qnsensord." + std::to_string(lChannelNo) + ".sock";
-    QNCPointer<QNCSensorChannel> lChannel(new (std::nothrow) QNCSensorChannel(lPath), QNPST_Individual, QNPAT_New);
+    QNCPointer<QNCSensorChannel> lChannel(new (std::nothrow) QNCSensorChannel(lPath), QNPST_Individual,
+                                          QNPAT_New);
     mChannels.append(lChannel);
-    mReaders.append(QNCPointer<QNCReader>(new (std::nothrow) QNCSensorChannelReader(*lChannel), QNPST_Individual,
-                                          QNPAT_New));
-    mWriters.append(QNCPointer<QNCWriter>(new (std::nothrow) QNCSensorChannelWriter(*lChannel), QNPST_Individual,
-                                          QNPAT_New));
+    mReaders.append(QNCPointer<QNCReader>(new (std::nothrow) QNCSensorChannelReader(*lChannel),
+                                          QNPST_Individual, QNPAT_New));
+    mWriters.append(QNCPointer<QNCWriter>(new (std::nothrow) QNCSensorChannelWriter(*lChannel),
+                                          QNPST_Individual, QNPAT_New));
     QN_LOG_NOTICE("Channel %u listening on %s", lChannelNo, lPath.c_str());
   }
-  mWaitConditionals.append(QNCPointer<QNCConditional>(new (std::nothrow) QNCConditional, QNPST_Individual, QNPAT_New));
+  mWaitConditionals.append(
+      QNCPointer<QNCConditional>(new (std::nothrow) QNCConditional, QNPST_Individual, QNPAT_New));
   mLists.append(QNCPointer<QNCSynchList>(new (std::nothrow) QNCSynchList, QNPST_Individual, QNPAT_New));
   QN_LEFT();
 }
 
 void QNCSensorSystem::createThreads() {
   QNCSystem::createThreads();
-  QNCPointer<QNCThreadPool> lReporters(new (std::nothrow) QNCThreadPool("Reporters", 1), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCThreadPool> lReporters(new (std::nothrow) QNCThreadPool("Reporters", 1), QNPST_Individual,
+                                       QNPAT_New);
   for (unsigned int lChannelNo = 0; lChannelNo < mChannels.numberOfElements(); ++lChannelNo) {
     mThreadComponents.append(QNCPointer<QNCThreadComponent>(
-        new (std::nothrow) QNCChannelWorker(*this, *mChannels[lChannelNo], lChannelNo), QNPST_Individual, QNPAT_New));
+        new (std::nothrow) QNCChannelWorker(*this, *mChannels[lChannelNo], lChannelNo, mIdleLimit),
+        QNPST_Individual, QNPAT_New));
   }
   mThreadComponents.append(QNCPointer<QNCThreadComponent>(
       new (std::nothrow) QNCReadingConsumer(*this, mStatistics, lReporters), QNPST_Individual, QNPAT_New));
@@ -67,25 +71,10 @@ void QNCSensorSystem::createThreads() {
   mThreadPools.append(lReporters);
 }
 
-bool QNCSensorSystem::waitForReadings() {
-  // The conditional's lock is held from the emptiness test to the wait, and producers signal
-  // under it, so no wake-up is lost; the time limit lets the exit flag be seen.
-  QNCConditional& lReady = *mWaitConditionals[kReadingsReady];
-  lReady.lock();
-  while (isListEmpty(kReadingList) && !isSetForExit()) {
-    try {
-      lReady.timedWait(250);
-    } catch (const QNCTimeOutEx&) {
-      // Look at the list and the exit flag again.
-    }
-  }
-  lReady.unlock();
-  return !isListEmpty(kReadingList);
-}
-
 void QNCSensorSystem::createStartUpEvent() {
   QNCSystem::createStartUpEvent();
-  QN_LOG_NOTICE("qnsensord running: %u channels, pid %d", mChannels.numberOfElements(), static_cast<int>(getpid()));
+  QN_LOG_NOTICE("qnsensord running: %u channels, pid %d", mChannels.numberOfElements(),
+                static_cast<int>(getpid()));
 }
 
 void QNCSensorSystem::destroy() {
@@ -95,7 +84,7 @@ void QNCSensorSystem::destroy() {
   QN_LOG_NOTICE("Statistics: %lu readings from %u sensors", mStatistics.total(),
                 static_cast<unsigned int>(lSnapshot.size()));
   for (const auto& lrEntry : lSnapshot) {
-    QN_LOG_NOTICE("Sensor %s: count %lu, min %.2f, max %.2f, mean %.2f", lrEntry.first.c_str(), lrEntry.second.mCount,
-                  lrEntry.second.mMin, lrEntry.second.mMax, lrEntry.second.mean());
+    QN_LOG_NOTICE("Sensor %s: count %lu, min %.2f, max %.2f, mean %.2f", lrEntry.first.c_str(),
+                  lrEntry.second.mCount, lrEntry.second.mMin, lrEntry.second.mMax, lrEntry.second.mean());
   }
 }

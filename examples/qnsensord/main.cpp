@@ -24,5 +24,6 @@ int main(int argc, char** argv) {
     fprintf(stderr, "qnsensord: %s\n", acrException.what());
     return 1;
   }
-  return 0;
+  // 1 when a thread died: the service then ended in order by itself, and says so to its supervisor.
+  return getRunExitStatus();
 }

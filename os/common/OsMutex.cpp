@@ -81,3 +81,8 @@ void OsSignal(pthread_cond_t& arCondition) noexcept {
   // Cannot fail on an initialised condition variable.
   pthread_cond_signal(&arCondition);
 }
+
+void OsBroadcast(pthread_cond_t& arCondition) noexcept {
+  // Cannot fail on an initialised condition variable.
+  pthread_cond_broadcast(&arCondition);
+}

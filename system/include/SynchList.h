@@ -39,6 +39,9 @@ class QNCSynchList {
   // "Not Found" (8) when the list is empty; the list is then unchanged and its lock released.
   QNCPointer<QNCQueueable> delist();
   QNCPointer<QNCQueueable> delistBack();
+  // delist() without the exception: false (arElement unchanged) when the list is empty. One pass
+  // through the lock and no allocation; arElement's former object is released after the lock.
+  bool tryDelist(QNCPointer<QNCQueueable>& arElement);
 
   // A copy of the head element, made under the lock. Throws QNCNotFoundEx "Not Found" (8) when
   // the list is empty.

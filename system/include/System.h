@@ -23,9 +23,10 @@
 // guards mNumericIdManager only; each conditional, queue, list, buffer bucket and channel end has
 // its own. Where two are held together, the order is, outermost first:
 //   1. a conditional's lock (waitOnEmptyQueue/waitOnEmptyList hold it around their emptiness
-//      test; an application may test its own condition under it);
-//   2. a list's or queue's lock for that emptiness test, or mExitLock for isSetForExit() called
-//      under a conditional's lock (the example service's consumer does so);
+//      test, the exit-aware waits around their test and take; an application may test its own
+//      condition under it);
+//   2. a list's or queue's lock for that test or take, or mExitLock for the exit test
+//      (isSetForExit(), which an application may also call under a conditional's lock);
 //   3. the logger's own locks: a line may be logged while any other lock is held.
 // No lock is taken while one of a later rank is held. The library never holds two locks of one
 // rank together, and a bucket's lock, mNidCreationLock and a channel end's lock only ever have
@@ -64,6 +65,13 @@ class QNCWriter;
 
 // The elements of a synchronised list and the iterators that walk it.
 using QNCQueueableList = QNCList<QNCPointer<QNCQueueable>>;
+
+// How an exit-aware wait ended (waitOnEmptyListOrExit and its kin).
+enum QNEWaitStatus : unsigned char {
+  QNWS_Ready = 0,     // the list or queue holds an element (the take: it has been removed)
+  QNWS_Exit = 1,      // the process is marked for exit and the list or queue is empty
+  QNWS_TimedOut = 2,  // the time limit passed with the list or queue still empty
+};
 
 class QNCSystem : public QNCSystemInterface {
  public:
@@ -142,16 +150,9 @@ class QNCSystem : public QNCSystemInterface {
   // that needs a condition keeps it itself). timedWait(): the same, at most aWaitTime
   // milliseconds on the monotonic clock; a time-out throws QNCTimeOutEx. Both release the
   // conditional's lock before any exception leaves, so the conditional stays usable.
-  // Neither looks at the exit flag, and shut-down signals no conditional. A thread that must end
-  // on request waits in slices and checks the flag between them:
-  //   while (!isSetForExit()) {
-  //     if (isListEmpty(l)) {
-  //       try { timedWait(c, 1000); } catch (QNCTimeOutEx&) { continue; }
-  //     }
-  //     try { handle(delist(l)); } catch (QNCNotFoundEx&) {}  // another consumer was first
-  //   }
-  // A signal between isListEmpty() and timedWait() is not seen by that wait; it delays the
-  // element by at most one slice and never loses it, and the exit request by at most one slice.
+  // Neither looks at the exit flag; makeThreadsToExit wakes every waiter once (wait() then
+  // returns as after any wake-up). A thread that must end on request uses the exit-aware waits
+  // below (delistOrExit, waitOnEmptyListOrExit, ...).
   virtual void wait(unsigned int acConditionNo);
   virtual void timedWait(unsigned int acConditionNo, unsigned int aWaitTime);
   // send/receive: write/read on writer/reader acWriterNo/acReaderNo (separate objects); no lock
@@ -168,9 +169,10 @@ class QNCSystem : public QNCSystemInterface {
   // When it already holds one they still take that lock for the one test, then release it and
   // return without waiting; a busy consumer therefore meets its producers' signal() on that lock.
   // They neither remove the element (another consumer may take it before the caller's
-  // dequeue/delist) nor look at the exit flag (see timedWait for a wait that ends on request).
+  // dequeue/delist) nor look at the exit flag (see delistOrExit for a wait that ends on request).
   // The conditional's lock is released before any exception leaves.
   // enqueue/enlist/enlistFront signal nothing: the producer follows them with signal(c).
+  // The exit-aware waits are declared after destroyThreads (they came later).
   virtual void waitOnEmptyQueue(unsigned int acConditionNo, unsigned int acQueueNo);
   virtual void enqueue(unsigned int acQueueNo, const QNCPointer<QNCQueueable>& acrElement);
   virtual QNCPointer<QNCQueueable> dequeue(unsigned int acQueueNo);
@@ -215,6 +217,27 @@ class QNCSystem : public QNCSystemInterface {
   // what ClibChdir throws.
   virtual void systemDaemonize(QNCString acDir, QNCString acStdIn, QNCString acStdOut, QNCString acStdErr);
   virtual void destroyThreads();
+
+  // --- Exit-aware waits. They wait on conditional acConditionNo (numbers asserted first) until
+  // list/queue n holds an element (QNWS_Ready), the process is marked for exit (QNWS_Exit) or
+  // aMaxWaitMs milliseconds have passed on the monotonic clock (QNWS_TimedOut; 0: no limit), and
+  // say which. An element wins over the exit request, so consumers drain what was handed over
+  // before they end. makeThreadsToExit wakes them at once; the producer's enlist/enqueue and
+  // signal(c) wake them as for waitOnEmptyList. Thread-safe; the conditional's lock is released
+  // before any exception (the list's or queue's) leaves.
+  // waitOn...OrExit only wait: another consumer may take the element before the caller does.
+  virtual QNEWaitStatus waitOnEmptyListOrExit(unsigned int acConditionNo, unsigned int acListNo,
+                                              unsigned int aMaxWaitMs);
+  virtual QNEWaitStatus waitOnEmptyQueueOrExit(unsigned int acConditionNo, unsigned int acQueueNo,
+                                               unsigned int aMaxWaitMs);
+  // delistOrExit/dequeueOrExit wait the same way and take the head in the same call: on
+  // QNWS_Ready arElement holds the removed head, otherwise it is empty (its former object is
+  // released on entry, before any lock). An element that is there already costs one pass through
+  // the list's or queue's lock and none through the conditional's.
+  virtual QNEWaitStatus delistOrExit(unsigned int acConditionNo, unsigned int acListNo,
+                                     unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement);
+  virtual QNEWaitStatus dequeueOrExit(unsigned int acConditionNo, unsigned int acQueueNo,
+                                      unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement);
 
   // --- Non-virtual members.
   void checkCommandLine(int argc, char** argv, QNCString& aCommandLine);

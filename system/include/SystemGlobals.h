@@ -10,7 +10,7 @@
 //     } catch (const QNCParentExitEx&) {
 //       return waitForDaemonStart();      // 0 once the daemon runs; 1 and its reason otherwise
 //     }
-//     return 0;
+//     return getRunExitStatus();          // 1 when a thread died and ended the run
 //   }
 //
 // SystemMain enables every log level, runs SysInit (the lifecycle operations of QNCSystem in
@@ -67,3 +67,10 @@ void SystemMain(int argc, char** argv);
 // Standard error, moved aside in the parents while they left start-up (so that their halt lines
 // stay off the terminal), is put back first; a parent that never calls this keeps it on /dev/null.
 int waitForDaemonStart();
+// The status main should return once SystemMain has returned: 0, or 1 when the run failed
+// because a thread component or pool thread ended by an exception (ThreadComponent.h,
+// ThreadPool.h; the orderly exit then started by itself). Any thread, at any time.
+int getRunExitStatus();
+// True once the run has failed (the same fact as getRunExitStatus() != 0). One atomic load, no
+// lock: cheap enough for a watchdog or a health check to poll from any thread.
+bool hasRunFailed();

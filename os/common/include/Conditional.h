@@ -36,6 +36,8 @@ class QNCConditional {
 
   // Wakes one waiting thread, none if none waits. Never throws.
   void signal() { OsSignal(mCondition); }
+  // Wakes every waiting thread. Never throws.
+  void broadcast() { OsBroadcast(mCondition); }
 
  private:
   QNCMutex mMutex;  // guards the condition the waiting threads test

@@ -59,6 +59,8 @@ int OsConditionalTimedWait(pthread_cond_t& arCondition, pthread_mutex_t& arMutex
 // Wakes one thread waiting on the condition variable; none if none waits, and the signal is not
 // remembered for a later wait. Needs no mutex held. Never throws.
 void OsSignal(pthread_cond_t& arCondition) noexcept;
+// As OsSignal, but wakes every waiting thread.
+void OsBroadcast(pthread_cond_t& arCondition) noexcept;
 
 // ---- File locks: one exclusive lock on the whole file (however it grows), never waited for.
 // They are open-file-description locks (F_OFD_SETLK): the lock belongs to the open file behind

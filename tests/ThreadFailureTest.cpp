@@ -1,0 +1,120 @@
+// A thread that dies is never forgotten: by default it fails the run and starts the orderly exit;
+// a component may restart its work instead. The tests run in file order: the restart case
+// first, while the run has not failed yet.
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <stdexcept>
+
+#include "DeathTestSupport.h"
+#include "LogSupport.h"
+#include "RunStatus.h"
+#include "SystemGlobals.h"
+#include "TableSystem.h"
+#include "ThreadComponent.h"
+#include "ThreadPool.h"
+
+namespace {
+
+// Throws from run() aFailures times, then waits for its exit request.
+class FailingComponent : public QNCThreadComponent {
+ public:
+  FailingComponent(const char* apName, int aFailures, bool aRestart)
+      : QNCThreadComponent(apName), mFailures(aFailures), mRestart(aRestart) {}
+  std::atomic<int> mRuns{0};
+
+ protected:
+  void run() override {
+    if (mRuns.fetch_add(1) < mFailures) throw std::runtime_error("sensor bus gone");
+    while (!waitForExitRequest(1000)) {
+    }
+  }
+  bool restartAfterFailure(const char* apWhat) override {
+    return mRestart ? true : QNCThreadComponent::restartAfterFailure(apWhat);
+  }
+
+ private:
+  const int mFailures;
+  const bool mRestart;
+};
+
+class FailureSystem : public qntest::TableSystem {
+ public:
+  FailureSystem() : TableSystem(0, 0, 0) {}
+  void add(QNCThreadComponent* apComponent) {
+    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent));
+  }
+  void add(QNCThreadPool* apPool) { mThreadPools.append(QNCPointer<QNCThreadPool>(apPool)); }
+};
+
+FailureSystem* gspSystem = nullptr;
+std::atomic<int> gsExitRequests{0};
+void requestExit() {
+  ++gsExitRequests;
+  gspSystem->makeThreadsToExit();
+}
+
+class ThreadFailureTest : public qntest::LoggedTest {
+ protected:
+  void SetUp() override {
+    LoggedTest::SetUp();
+    gspSystem = &mSystem;
+    QNSetExitRequest(requestExit);
+  }
+  void TearDown() override {
+    QNSetExitRequest(nullptr);
+    LoggedTest::TearDown();
+  }
+  FailureSystem mSystem;
+};
+
+// Two failures, each restarted by the override: the third run serves until the exit request; the
+// run has not failed and nobody asked for an exit.
+TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
+  FailingComponent* lpComponent = new FailingComponent("Restarter", 2, true);
+  mSystem.add(lpComponent);
+  mSystem.startThreads();
+  while (lpComponent->mRuns.load() < 3) std::this_thread::yield();
+  mSystem.makeThreadsToExit();
+  mSystem.waitForThreads();
+  EXPECT_EQ(3, lpComponent->mRuns.load());
+  EXPECT_FALSE(hasRunFailed());
+  EXPECT_EQ(0, getRunExitStatus());
+  EXPECT_EQ(0, gsExitRequests.load());  // the first test of the file
+  EXPECT_EQ(2u, qntest::countOf(log(), "Thread 'Restarter' restarts its work"));
+}
+
+// A component that dies, beside one that only ends on request and a pool: the dead one's error
+// line names it and the exception, the run is failed (status 1), and the exit request it started
+// ends the others, so waitForThreads returns. Before: the others ran on and the status stayed 0.
+TEST_F(ThreadFailureTest, DyingThreadFailsTheRunAndEndsTheOthers) {
+  const int lBefore = gsExitRequests.load();
+  mSystem.add(new FailingComponent("Bystander", 0, false));  // started first: it can take the request
+  mSystem.add(new FailingComponent("Dying", 1, false));
+  mSystem.add(new QNCThreadPool("Pool", 1));
+  mSystem.startThreads();
+  EXPECT_TRUE(qntest::returnsWithin([this] { mSystem.waitForThreads(); }, std::chrono::seconds(5),
+                                    [this] { mSystem.makeThreadsToExit(); }));
+  EXPECT_TRUE(hasRunFailed());
+  EXPECT_EQ(1, getRunExitStatus());
+  EXPECT_EQ(lBefore + 1, gsExitRequests.load());
+  EXPECT_EQ("-E-", qntest::levelOf(log(), "Thread 'Dying' ended by an exception: sensor bus gone"));
+}
+
+// A pool task that throws fails the run the same way; the worker goes on with the next task.
+TEST_F(ThreadFailureTest, FailingPoolTaskFailsTheRun) {
+  const int lBefore = gsExitRequests.load();
+  QNCThreadPool lPool("Failing", 1);
+  std::atomic<int> lLaterTasks{0};
+  lPool.init();
+  lPool.submit([] { throw std::runtime_error("report lost"); });
+  lPool.submit([&lLaterTasks] { ++lLaterTasks; });
+  lPool.finish();
+  lPool.waitForThreads();
+  EXPECT_EQ(1, lLaterTasks.load());
+  EXPECT_EQ(lBefore + 1, gsExitRequests.load());
+  EXPECT_EQ("-E-", qntest::levelOf(log(), "ThreadPool 'Failing': task failed: report lost"));
+}
+
+}  // namespace
