@@ -14,12 +14,12 @@ void setTraceLogging(bool aOn);
 }  // namespace qnbench
 
 // main() for a benchmark program: starts the second thread, then runs the registered benchmarks.
-#define QN_BENCHMARK_MAIN()                                        \
-  int main(int argc, char** argv) {                                \
-    qnbench::startSecondThread();                                  \
-    ::benchmark::Initialize(&argc, argv);                          \
+#define QN_BENCHMARK_MAIN()                                             \
+  int main(int argc, char** argv) {                                     \
+    qnbench::startSecondThread();                                       \
+    ::benchmark::Initialize(&argc, argv);                               \
     if (::benchmark::ReportUnrecognizedArguments(argc, argv)) return 1; \
-    ::benchmark::RunSpecifiedBenchmarks();                         \
-    ::benchmark::Shutdown();                                       \
-    return 0;                                                      \
+    ::benchmark::RunSpecifiedBenchmarks();                              \
+    ::benchmark::Shutdown();                                            \
+    return 0;                                                           \
   }

@@ -188,11 +188,13 @@ double streamStandard(int aProducers, int aConsumers, const std::vector<std::sha
 }
 
 double streamSystem(HandOffSystem& arSystem, int aProducers, int aConsumers,
-                    const std::vector<QNCPointer<QNCQueueable>>& acrItems, const QNCPointer<QNCQueueable>& acrStop) {
+                    const std::vector<QNCPointer<QNCQueueable>>& acrItems,
+                    const QNCPointer<QNCQueueable>& acrStop) {
   const int lShare = kStreamBatch / aProducers;
   return runThreads(aProducers + aConsumers, [&](int aIndex) {
     if (aIndex < aProducers) {
-      for (int lItem = aIndex * lShare; lItem < (aIndex + 1) * lShare; ++lItem) arSystem.handOff(0, acrItems[lItem]);
+      for (int lItem = aIndex * lShare; lItem < (aIndex + 1) * lShare; ++lItem)
+        arSystem.handOff(0, acrItems[lItem]);
       arSystem.handOff(0, acrStop);
     } else {
       while (arSystem.take(0).get() != acrStop.get()) {
@@ -249,7 +251,12 @@ void BM_Stream(benchmark::State& arState) {
   reportSameLocks(arState, lSeconds[1], lSeconds[2], lItems);
   qnbench::setTraceLogging(true);
 }
-BENCHMARK(BM_Stream)->ArgNames({"producers", "consumers"})->Args({1, 1})->Args({2, 2})->UseManualTime()->Iterations(40);
+BENCHMARK(BM_Stream)
+    ->ArgNames({"producers", "consumers"})
+    ->Args({1, 1})
+    ->Args({2, 2})
+    ->UseManualTime()
+    ->Iterations(40);
 
 void BM_PingPong(benchmark::State& arState) {
   qnbench::setTraceLogging(false);
@@ -293,7 +300,8 @@ void BM_PingPong(benchmark::State& arState) {
     arState.SetIterationTime(lRound);
     lBaselineFirst = !lBaselineFirst;
   }
-  reportRates(arState, lBaselineSeconds, lSystemSeconds, static_cast<double>(arState.iterations()) * kPingPongBatch);
+  reportRates(arState, lBaselineSeconds, lSystemSeconds,
+              static_cast<double>(arState.iterations()) * kPingPongBatch);
   qnbench::setTraceLogging(true);
 }
 BENCHMARK(BM_PingPong)->UseManualTime()->Iterations(20);

@@ -65,9 +65,10 @@ BENCHMARK(BM_Logger_TraceLine)->Threads(1)->Threads(2)->UseRealTime();
 
 // The same line as the logger writes, formatted the plain way and written with one write() each:
 // what the logger did before it buffered.
-__attribute__((noinline, format(printf, 6, 7))) void naiveLogLine(int aFd, const char* apTag, unsigned int aLine,
-                                                                 const char* apFunction, const char* apFile,
-                                                                 const char* apFormat, ...) {
+__attribute__((noinline, format(printf, 6, 7))) void naiveLogLine(int aFd, const char* apTag,
+                                                                  unsigned int aLine, const char* apFunction,
+                                                                  const char* apFile, const char* apFormat,
+                                                                  ...) {
   char lLine[kQNLogMaxLine];
   struct timeval lNow;
   gettimeofday(&lNow, nullptr);
@@ -75,8 +76,8 @@ __attribute__((noinline, format(printf, 6, 7))) void naiveLogLine(int aFd, const
   localtime_r(&lNow.tv_sec, &lTm);
   int lUsed = snprintf(lLine, sizeof lLine, "%04d-%02d-%02d %02d:%02d:%02d.%06ld %s [%ld] %s (%s:%u) ",
                        lTm.tm_year + 1900, lTm.tm_mon + 1, lTm.tm_mday, lTm.tm_hour, lTm.tm_min, lTm.tm_sec,
-                       static_cast<long>(lNow.tv_usec), apTag, static_cast<long>(syscall(SYS_gettid)), apFunction,
-                       apFile, aLine);
+                       static_cast<long>(lNow.tv_usec), apTag, static_cast<long>(syscall(SYS_gettid)),
+                       apFunction, apFile, aLine);
   va_list lArgs;
   va_start(lArgs, apFormat);
   lUsed += vsnprintf(lLine + lUsed, sizeof lLine - lUsed - 1, apFormat, lArgs);

@@ -15,7 +15,9 @@ unsigned char* allocateStorage(unsigned int aCapacity) {
 }  // namespace
 
 QNCBuffer::QNCBuffer(unsigned int acUseLength, unsigned int acMaxLength)
-    : mStorage(nullptr), mLength(acUseLength), mCapacity(acMaxLength < acUseLength ? acUseLength : acMaxLength) {
+    : mStorage(nullptr),
+      mLength(acUseLength),
+      mCapacity(acMaxLength < acUseLength ? acUseLength : acMaxLength) {
   mStorage = allocateStorage(mCapacity);
 }
 

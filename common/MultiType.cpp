@@ -120,10 +120,12 @@ void QNCMultiType::decode(const QNCString& acrText) {
       // The magnitude limit 128 admits "-128"; "128" itself is refused below.
       if (!parseDecimal(acrText.get(), true, 128, lNegative, lMagnitude) || (!lNegative && lMagnitude == 128))
         throwNotAValue(acrText, mKind);
-      mSignedByte = static_cast<signed char>(lNegative ? -static_cast<int>(lMagnitude) : static_cast<int>(lMagnitude));
+      mSignedByte =
+          static_cast<signed char>(lNegative ? -static_cast<int>(lMagnitude) : static_cast<int>(lMagnitude));
       return;
     case QNMTK_Unsigned:
-      if (!parseDecimal(acrText.get(), false, 0xFFFFFFFFULL, lNegative, lMagnitude)) throwNotAValue(acrText, mKind);
+      if (!parseDecimal(acrText.get(), false, 0xFFFFFFFFULL, lNegative, lMagnitude))
+        throwNotAValue(acrText, mKind);
       mUnsigned = static_cast<unsigned int>(lMagnitude);
       return;
   }

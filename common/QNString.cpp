@@ -9,15 +9,15 @@ QNCString::QNCString(const char* apString) {
 
 QNCString::QNCString(const QNCString& acrCopy) {
   QN_ASSERT(acrCopy.mString != 0);
-  mString = QNCPointer<std::string>(new (std::nothrow) std::string(*acrCopy.mString), QNPST_Individual,
-                                    QNPAT_New);
+  mString =
+      QNCPointer<std::string>(new (std::nothrow) std::string(*acrCopy.mString), QNPST_Individual, QNPAT_New);
 }
 
 QNCString& QNCString::operator=(const QNCString& acrCopy) {
   if (this == &acrCopy) return *this;
   QN_ASSERT(acrCopy.mString != 0);
-  mString = QNCPointer<std::string>(new (std::nothrow) std::string(*acrCopy.mString), QNPST_Individual,
-                                    QNPAT_New);
+  mString =
+      QNCPointer<std::string>(new (std::nothrow) std::string(*acrCopy.mString), QNPST_Individual, QNPAT_New);
   return *this;
 }
 

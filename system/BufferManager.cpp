@@ -21,9 +21,11 @@ QNCBufferManager::QNCBufferManager(QNCSystem* apSystem)
   for (const unsigned int lLength : lBufferList) {
     mBufferLengths.append(lLength);
     QN_LOG_TRACE("Creating buffer Queue mutexes for length = %u", lLength);
-    mBufferQueueMutexes.append(QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex, QNPST_Individual, QNPAT_New));
+    mBufferQueueMutexes.append(
+        QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex, QNPST_Individual, QNPAT_New));
     QN_LOG_TRACE("Creating Buffer Queues for length = %u", lLength);
-    mBufferQueues.append(QNCPointer<QNCBufferQueue>(new (std::nothrow) QNCBufferQueue, QNPST_Individual, QNPAT_New));
+    mBufferQueues.append(
+        QNCPointer<QNCBufferQueue>(new (std::nothrow) QNCBufferQueue, QNPST_Individual, QNPAT_New));
   }
   QN_LEFT();
 }
@@ -77,8 +79,8 @@ void QNCBufferManager::get(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer
     QNCPointer<QNCBuffer> lBuffer;
     if (lQueue.isEmpty()) {
       QN_LOG_TRACE("No existing buffers.. creating new of %u size", lBufferSize);
-      lBuffer = QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, lBufferSize), QNPST_Individual,
-                                      QNPAT_New);
+      lBuffer = QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, lBufferSize),
+                                      QNPST_Individual, QNPAT_New);
     } else {
       QN_LOG_TRACE("Got buffer of %u length from bucket # %u", lBufferSize, lIndex);
       lBuffer = lQueue.dequeue();
@@ -120,8 +122,8 @@ void QNCBufferManager::reuse(QNCPointer<QNCBuffer>& arBuffer) {
   // later be asked for a length it cannot hold, so it is dropped here instead.
   const unsigned int lBucketLength = _bucketBufferLength(lIndex);
   if (arBuffer->getCapacity() < lBucketLength) {
-    QN_LOG_TRACE("Buffer capacity %u below bucket # %u length %u... Need not be reused", arBuffer->getCapacity(),
-                 lIndex, lBucketLength);
+    QN_LOG_TRACE("Buffer capacity %u below bucket # %u length %u... Need not be reused",
+                 arBuffer->getCapacity(), lIndex, lBucketLength);
     QN_LEFT();
     return;
   }

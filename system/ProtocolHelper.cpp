@@ -16,7 +16,8 @@ constexpr unsigned int kMaxAttempts = 301;
 constexpr unsigned int kReadFailedCode = 328;
 
 QNCPointer<QNCBuffer> newBuffer(unsigned int acLength) {
-  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(acLength, 0), QNPST_Individual, QNPAT_New);
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(acLength, 0), QNPST_Individual,
+                               QNPAT_New);
 }
 
 // A peer decides how often a message is oversized, so its line is rate-limited (WarningLimiter.h).
@@ -156,7 +157,8 @@ void QNCProtocolHelper::__writeSize(QNCPointer<QNCWriter>& arWriter, unsigned in
   QN_LEFT();
 }
 
-void QNCProtocolHelper::__writeActual(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer) {
+void QNCProtocolHelper::__writeActual(QNCPointer<QNCWriter>& arWriter,
+                                      const QNCPointer<QNCBuffer>& acrBuffer) {
   QN_ENTERED();
   unsigned int lCount = 0;
   arWriter->write(acrBuffer, lCount);

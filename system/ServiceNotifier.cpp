@@ -1,7 +1,5 @@
 #include "ServiceNotifier.h"
 
-#include "RunStatus.h"
-
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
@@ -9,6 +7,7 @@
 
 #include "Logger.h"
 #include "OsService.h"
+#include "RunStatus.h"
 #include "System.h"
 
 namespace {

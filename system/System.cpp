@@ -63,8 +63,8 @@ void QNCSystem::preInit() {
       QNCPointer<QNCCommandLineParser>(new (std::nothrow) QNCCommandLineParser, QNPST_Individual, QNPAT_New);
   QN_LOG_TRACE("Creating Config File Parser...");
   mConfigFileParser = QNCPointer<QNCKeyValueFormatParser>(
-      new (std::nothrow) QNCKeyValueFormatParser(QNCString(""), QNCString(""), false, false), QNPST_Individual,
-      QNPAT_New);
+      new (std::nothrow) QNCKeyValueFormatParser(QNCString(""), QNCString(""), false, false),
+      QNPST_Individual, QNPAT_New);
   QN_LOG_TRACE("Setting the command line argument descriptor");
   setCommandLineArgumentDesc();
   QN_LEFT();
@@ -84,10 +84,12 @@ void QNCSystem::init() {
   mAddress = QNCPointer<QNCIpAddress>(new (std::nothrow) QNCIpAddress(lAddress), QNPST_Individual, QNPAT_New);
   QN_LOG_NOTICE("IpAddress: %s", mAddress->getStringForm());
   QN_LOG_TRACE("Creating Numeric Id Manager...");
-  mNumericIdManager = QNCPointer<QNCNumericIdManager>(new (std::nothrow) QNCNumericIdManager, QNPST_Individual, QNPAT_New);
+  mNumericIdManager =
+      QNCPointer<QNCNumericIdManager>(new (std::nothrow) QNCNumericIdManager, QNPST_Individual, QNPAT_New);
   QN_LOG_TRACE("Creating NID creation lock...");
   mNidCreationLock = QNCPointer<QNCMutex>(new (std::nothrow) QNCMutex, QNPST_Individual, QNPAT_New);
-  mProtocolHelper = QNCPointer<QNCProtocolHelper>(new (std::nothrow) QNCProtocolHelper(100), QNPST_Individual, QNPAT_New);
+  mProtocolHelper =
+      QNCPointer<QNCProtocolHelper>(new (std::nothrow) QNCProtocolHelper(100), QNPST_Individual, QNPAT_New);
   QN_LEFT();
 }
 

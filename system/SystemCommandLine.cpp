@@ -28,7 +28,8 @@ QNCString& valueOf(QNCPointer<QNCCommandLineArgument>& arArgument) {
 // True and arArgument set when the option is on the command line; false when the parser reports
 // it absent (QNCNotFoundEx). Only the lookup is guarded, so the same exception thrown later by
 // whatever the handler does for a found option is never mistaken for "absent".
-bool isGiven(QNCCommandLineParser& arParser, const char* apOption, QNCPointer<QNCCommandLineArgument>& arArgument) {
+bool isGiven(QNCCommandLineParser& arParser, const char* apOption,
+             QNCPointer<QNCCommandLineArgument>& arArgument) {
   try {
     arParser.getArgument(apOption, arArgument);
     return true;
@@ -173,9 +174,8 @@ void QNCSystem::processConfigFileCommandLineArgument() {
   QNCOptionValueArgument* lpArg = dynamic_cast<QNCOptionValueArgument*>(lArgument.get());
   QN_ASSERT(NULL != lpArg);
   QN_LOG_TRACE("Adding 'ConfigFile' system setting");
-  addSetting("ConfigFile",
-             QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lpArg->getValue().get()), QNPST_Individual,
-                                      QNPAT_New));
+  addSetting("ConfigFile", QNCPointer<QNCMultiType>(new (std::nothrow) QNCMultiType(lpArg->getValue().get()),
+                                                    QNPST_Individual, QNPAT_New));
   QN_LEFT();
 }
 

@@ -17,7 +17,8 @@ class QNCAllocatedBuffer : public QNCBuffer {
   // Used length acUseLength, capacity acMaxLength (or acUseLength when acMaxLength is 0).
   // A zero used length, or a used length above a non-zero maximum, is a bug of the caller: the
   // constructor asserts both (exit status 1) after the storage has been made.
-  QNCAllocatedBuffer(unsigned int acUseLength, unsigned int acMaxLength) : QNCBuffer(acUseLength, acMaxLength) {
+  QNCAllocatedBuffer(unsigned int acUseLength, unsigned int acMaxLength)
+      : QNCBuffer(acUseLength, acMaxLength) {
     QN_ASSERT(acUseLength != 0);
     QN_ASSERT(acMaxLength == 0 || acUseLength <= acMaxLength);
   }

@@ -11,8 +11,7 @@
                                     const char* apFile);
 
 #define QN_ASSERT(condition) QN_ASSERT_EXPANDED(condition)
-#define QN_ASSERT_EXPANDED(condition)                                     \
-  do {                                                                    \
-    if (__builtin_expect(!(condition), 0))                                \
-      QNAssertionFailed(#condition, __LINE__, __func__, __FILE__);        \
+#define QN_ASSERT_EXPANDED(condition)                                                                   \
+  do {                                                                                                  \
+    if (__builtin_expect(!(condition), 0)) QNAssertionFailed(#condition, __LINE__, __func__, __FILE__); \
   } while (0)

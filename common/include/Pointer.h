@@ -72,7 +72,8 @@ class QNCPointer {
   }
 
   // Shares a single object of a derived class.
-  template <class U, class = std::enable_if_t<std::is_convertible<U*, T*>::value && !std::is_same<U, T>::value>>
+  template <class U,
+            class = std::enable_if_t<std::is_convertible<U*, T*>::value && !std::is_same<U, T>::value>>
   QNCPointer(const QNCPointer<U>& acrCopy) noexcept
       : mPointer(acrCopy.mPointer),
         mReferenceCount(acrCopy.mReferenceCount),
@@ -80,7 +81,8 @@ class QNCPointer {
         mAllocationType(acrCopy.mAllocationType) {
     // The last reference may be this one, and delete through a base without a virtual
     // destructor would skip the derived part.
-    static_assert(std::is_same<std::remove_cv_t<T>, std::remove_cv_t<U>>::value || std::has_virtual_destructor<T>::value,
+    static_assert(std::is_same<std::remove_cv_t<T>, std::remove_cv_t<U>>::value ||
+                      std::has_virtual_destructor<T>::value,
                   "a QNCPointer to a base class needs a virtual destructor in the base");
     QN_ASSERT(0 != acrCopy.mPointer);
     QN_ASSERT(0 != acrCopy.mReferenceCount);
@@ -175,7 +177,8 @@ class QNCPointer {
   }
 
   void _release() noexcept {
-    if (mPointer != nullptr && mReferenceCount != nullptr && mReferenceCount->decrement() == 0) _releaseMemory();
+    if (mPointer != nullptr && mReferenceCount != nullptr && mReferenceCount->decrement() == 0)
+      _releaseMemory();
   }
 
   // The last reference is gone: free the counter, then the object as it was allocated.

@@ -55,7 +55,8 @@ struct QNSConnectionResult {
 };
 
 void usage() {
-  fprintf(stderr, "usage: qnsensor-feed [-d dir] [-n readings] [-m connections] [-c channels] [-e malformed] [-x]\n");
+  fprintf(stderr,
+          "usage: qnsensor-feed [-d dir] [-n readings] [-m connections] [-c channels] [-e malformed] [-x]\n");
 }
 
 bool parseCount(const char* apText, unsigned int& arValue) {
@@ -86,7 +87,8 @@ int connectTo(const std::string& acrPath) {
 }
 
 QNCPointer<QNCBuffer> bufferOf(const std::string& acrText) {
-  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow) QNCAllocatedBuffer(static_cast<unsigned int>(acrText.size()), 0),
+  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow)
+                                    QNCAllocatedBuffer(static_cast<unsigned int>(acrText.size()), 0),
                                 QNPST_Individual, QNPAT_New);
   memcpy(static_cast<unsigned char*>(*lBuffer), acrText.data(), acrText.size());
   return lBuffer;
@@ -96,12 +98,14 @@ void fail(QNSConnectionResult& arResult, const std::string& acrWhat) {
   if (arResult.mErrors++ == 0) arResult.mFirstError = acrWhat;
 }
 
-void runConnection(const QNSOptions& acrOptions, unsigned int aIndex, unsigned int aCount, unsigned int aMalformed,
-                   QNSConnectionResult& arResult) {
+void runConnection(const QNSOptions& acrOptions, unsigned int aIndex, unsigned int aCount,
+                   unsigned int aMalformed, QNSConnectionResult& arResult) {
   const int lFd = connectTo(socketPath(acrOptions, aIndex % acrOptions.mChannels));
-  if (lFd < 0) return fail(arResult, "cannot connect to " + socketPath(acrOptions, aIndex % acrOptions.mChannels));
+  if (lFd < 0)
+    return fail(arResult, "cannot connect to " + socketPath(acrOptions, aIndex % acrOptions.mChannels));
   const int lWriteFd = dup(lFd);
-  QNCPointer<QNCReader> lReader(new (std::nothrow) QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
+  QNCPointer<QNCReader> lReader(new (std::nothrow)
+                                    QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
                                 QNPST_Individual, QNPAT_New);
   QNCPointer<QNCWriter> lWriter(new (std::nothrow) QNCFdWriter(lWriteFd), QNPST_Individual, QNPAT_New);
   QNCProtocolHelper lHelper(1, 4096);
@@ -128,7 +132,8 @@ void runConnection(const QNSOptions& acrOptions, unsigned int aIndex, unsigned i
       if (!lReader->waitForActivity(60000)) return fail(arResult, "no answer within 60 s");
       QNCPointer<QNCBuffer> lAnswerBuffer;
       lHelper.read(lReader, lAnswerBuffer, 0);
-      arResult.mLatenciesUs.push_back(std::chrono::duration<double, std::micro>(Clock::now() - lStart).count());
+      arResult.mLatenciesUs.push_back(
+          std::chrono::duration<double, std::micro>(Clock::now() - lStart).count());
       QNSSensorAnswer lAnswer;
       const QNCBuffer& lBytes = *lAnswerBuffer;
       if (!QNParseAnswer(lBytes, lBytes.getLength(), lAnswer)) {
@@ -137,7 +142,8 @@ void runConnection(const QNSOptions& acrOptions, unsigned int aIndex, unsigned i
         fail(arResult, "answer for sequence " + lAnswer.mSequence + " where " + std::to_string(lSequence) +
                            " was expected");
       } else if (lAnswer.mAccepted == lMalformed) {
-        fail(arResult, "reading " + std::to_string(lSequence) + (lMalformed ? " accepted" : " refused: " + lAnswer.mReason));
+        fail(arResult, "reading " + std::to_string(lSequence) +
+                           (lMalformed ? " accepted" : " refused: " + lAnswer.mReason));
       } else if (lAnswer.mAccepted) {
         ++arResult.mAccepted;
       } else {
@@ -177,13 +183,26 @@ int main(int argc, char** argv) {
   while ((lOption = getopt(argc, argv, "d:n:m:c:e:x")) != -1) {
     bool lOk = true;
     switch (lOption) {
-      case 'd': lOptions.mDir = optarg; break;
-      case 'n': lOk = parseCount(optarg, lOptions.mReadings); break;
-      case 'm': lOk = parseCount(optarg, lOptions.mConnections) && lOptions.mConnections > 0; break;
-      case 'c': lOk = parseCount(optarg, lOptions.mChannels) && lOptions.mChannels > 0; break;
-      case 'e': lOk = parseCount(optarg, lOptions.mMalformed); break;
-      case 'x': lOptions.mCutOne = true; break;
-      default: lOk = false;
+      case 'd':
+        lOptions.mDir = optarg;
+        break;
+      case 'n':
+        lOk = parseCount(optarg, lOptions.mReadings);
+        break;
+      case 'm':
+        lOk = parseCount(optarg, lOptions.mConnections) && lOptions.mConnections > 0;
+        break;
+      case 'c':
+        lOk = parseCount(optarg, lOptions.mChannels) && lOptions.mChannels > 0;
+        break;
+      case 'e':
+        lOk = parseCount(optarg, lOptions.mMalformed);
+        break;
+      case 'x':
+        lOptions.mCutOne = true;
+        break;
+      default:
+        lOk = false;
     }
     if (!lOk) {
       usage();
@@ -200,8 +219,10 @@ int main(int argc, char** argv) {
   std::vector<std::thread> lThreads;
   const auto lStart = Clock::now();
   for (unsigned int k = 0; k < lOptions.mConnections; ++k) {
-    const unsigned int lCount = lOptions.mReadings / lOptions.mConnections + (k < lOptions.mReadings % lOptions.mConnections ? 1 : 0);
-    const unsigned int lMalformed = lOptions.mMalformed / lOptions.mConnections + (k < lOptions.mMalformed % lOptions.mConnections ? 1 : 0);
+    const unsigned int lCount =
+        lOptions.mReadings / lOptions.mConnections + (k < lOptions.mReadings % lOptions.mConnections ? 1 : 0);
+    const unsigned int lMalformed = lOptions.mMalformed / lOptions.mConnections +
+                                    (k < lOptions.mMalformed % lOptions.mConnections ? 1 : 0);
     lThreads.emplace_back(runConnection, std::cref(lOptions), k, lCount, lMalformed, std::ref(lResults[k]));
   }
   for (auto& lThread : lThreads) lThread.join();
@@ -220,12 +241,14 @@ int main(int argc, char** argv) {
   const unsigned int lMissing = lOptions.mReadings - (lAccepted + lRefused);
   if (lRefused != lOptions.mMalformed) lErrors += 1;
   if (lMissing != 0) lErrors += 1;
-  printf("qnsensor-feed: %u readings over %u connections (%u channels)\n", lOptions.mReadings, lOptions.mConnections,
-         lOptions.mChannels);
+  printf("qnsensor-feed: %u readings over %u connections (%u channels)\n", lOptions.mReadings,
+         lOptions.mConnections, lOptions.mChannels);
   printf("  answered: %u accepted, %u refused (%u malformed sent), %u missing\n", lAccepted, lRefused,
          lOptions.mMalformed, lMissing);
-  printf("  rate: %.0f readings/s over %.2f s\n", lSeconds > 0 ? (lAccepted + lRefused) / lSeconds : 0.0, lSeconds);
-  printf("  round trip: p50 %.0f us, p99 %.0f us\n", percentile(lLatencies, 0.50), percentile(lLatencies, 0.99));
+  printf("  rate: %.0f readings/s over %.2f s\n", lSeconds > 0 ? (lAccepted + lRefused) / lSeconds : 0.0,
+         lSeconds);
+  printf("  round trip: p50 %.0f us, p99 %.0f us\n", percentile(lLatencies, 0.50),
+         percentile(lLatencies, 0.99));
   printf("  errors: %u (%u readings sent)\n", lErrors, lSent);
   return lErrors == 0 ? 0 : 1;
 }

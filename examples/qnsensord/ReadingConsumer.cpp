@@ -56,8 +56,8 @@ void QNCReadingConsumer::_answer(QNCSensorReadingItem& arItem) {
     mSystem.getProtocolHelper()->write(mSystem.getWriter(arItem.mChannel), lAnswer, false);
   } catch (const QNCWriteFailedEx& acrFailure) {
     if (QNPeerWarning(QNPW_DroppedAnswer).admit())
-      QN_LOG_INFO("Channel %u: answer to reading %s dropped: %s", arItem.mChannel, arItem.mSequenceText.c_str(),
-                  acrFailure.what());
+      QN_LOG_INFO("Channel %u: answer to reading %s dropped: %s", arItem.mChannel,
+                  arItem.mSequenceText.c_str(), acrFailure.what());
   } catch (const QNCTimeOutEx& acrFailure) {
     if (QNPeerWarning(QNPW_UnreadAnswer).admit())
       QN_LOG_WARNING("Channel %u: client does not read its answers: %s", arItem.mChannel, acrFailure.what());

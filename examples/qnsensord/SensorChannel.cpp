@@ -133,8 +133,8 @@ bool QNCSensorChannel::waitForActivity(unsigned int aMilliseconds) {
   QNCPointer<QNCFdReader> lNewReader(new (std::nothrow)
                                          QNCFdReader(lFd, true, QNCFdReader::kDefaultStagingSize, 50),
                                      QNPST_Individual, QNPAT_New);
-  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, kAnswerDrainMs), QNPST_Individual,
-                                     QNPAT_New);
+  QNCPointer<QNCFdWriter> lNewWriter(new (std::nothrow) QNCFdWriter(lWriteFd, true, kAnswerDrainMs),
+                                     QNPST_Individual, QNPAT_New);
   QNCMutexLocker lGuard(mLock);
   mReader = lNewReader;
   mWriter = lNewWriter;

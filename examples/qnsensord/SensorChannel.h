@@ -58,7 +58,8 @@ class QNCSensorChannel {
   // Writes to the current connection if it is still generation acGeneration; returns false (and
   // writes nothing) when that connection has ended. A client whose socket stays full for
   // kAnswerDrainMs loses its connection: QNCTimeOutEx, and the connection is ended.
-  bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer, unsigned int& arCount);
+  bool writeIfCurrent(unsigned long acGeneration, const QNCPointer<QNCBuffer>& acrBuffer,
+                      unsigned int& arCount);
 
   // Ends the current connection (after the end of its stream, or a message that failed).
   void dropConnection();

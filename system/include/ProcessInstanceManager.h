@@ -117,6 +117,6 @@ class QNCProcessInstanceManager {
   bool _isSignallable(unsigned int aBytesRead, int aPid) const;
 
   QNCString mPidFilePath;
-  int mPidFileFd;                // -1 when closed
-  QNEFileLockStatus mLockStatus; // as last checked or set
+  int mPidFileFd;                 // -1 when closed
+  QNEFileLockStatus mLockStatus;  // as last checked or set
 };
