@@ -8,7 +8,6 @@ cd "$(dirname "$0")/.."
 
 seconds=${1:-600}
 build=build/test-normal
-source /work/ccache.env 2>/dev/null || true
 cmake -S . -B "$build" >/dev/null
 cmake --build "$build" -j2 --target qnsensord qnsensor-feed >/dev/null
 
