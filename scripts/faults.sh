@@ -20,7 +20,6 @@ if ! command -v fiu-run >/dev/null 2>&1 || [ ! -f /usr/lib/fiu/fiu_posix_preload
   $SUDO apt-get update -qq && DEBIAN_FRONTEND=noninteractive $SUDO apt-get install -y -qq libfiu-dev fiu-utils
 fi
 build=build/test-normal
-source /work/ccache.env 2>/dev/null || true
 cmake -S . -B "$build" >/dev/null && cmake --build "$build" -j2 --target qnsensord qnsensor-feed >/dev/null || exit 2
 service="$PWD/$build/examples/qnsensord"
 feed="$PWD/$build/examples/qnsensor-feed"
