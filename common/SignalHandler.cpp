@@ -79,7 +79,7 @@ void unlockAfterFork() { gsHandlersLock.unlock(); }
 void startDispatcher() {
   if (gsDispatcherPid.load() == ClibGetpid()) return;
   int lPipe[2];
-  OsCreateSignalPipe(lPipe[0], lPipe[1]);
+  OsOpenWakePipe(lPipe[0], lPipe[1]);
   // The registration returns only once the dispatcher runs: a fork right after it then never
   // copies a thread that is half-way through its start (holding the allocator's or a runtime's
   // locks, which the child could never get back).

@@ -10,6 +10,7 @@
 #include <cstring>
 
 #include "OsError.h"
+#include "OsStream.h"
 
 namespace {
 constexpr int kFirstFreeDescriptor = 3;
@@ -27,10 +28,11 @@ int moveAboveStandard(int aFd) {
 
 void OsOpenStartChannel(int& arReadFd, int& arWriteFd) {
   int lEnds[2];
-  if (pipe2(lEnds, O_CLOEXEC) != 0) OsThrowError<QNCOsException>(errno, "pipe2");
+  OsOpenWakePipe(lEnds[0], lEnds[1]);
   lEnds[0] = moveAboveStandard(lEnds[0]);
+  // The copies keep O_NONBLOCK: it belongs to the open pipe, not to the descriptor number.
   lEnds[1] = moveAboveStandard(lEnds[1]);
-  if (lEnds[0] < 0 || lEnds[1] < 0 || fcntl(lEnds[1], F_SETFL, O_NONBLOCK) != 0) {
+  if (lEnds[0] < 0 || lEnds[1] < 0) {
     const int lErrno = errno;
     OsCloseDescriptor(lEnds[0]);
     OsCloseDescriptor(lEnds[1]);

@@ -58,6 +58,19 @@ bool OsIsSocket(int aFd) {
   return getsockopt(aFd, SOL_SOCKET, SO_TYPE, &lType, &lLength) == 0;
 }
 
+void OsOpenWakePipe(int& arReadFd, int& arWriteFd) {
+  int lPipe[2];
+  if (pipe2(lPipe, O_CLOEXEC) != 0) OsThrowError<QNCOsException>(errno, "pipe2");
+  if (fcntl(lPipe[1], F_SETFL, O_NONBLOCK) != 0) {
+    const int lErrno = errno;
+    close(lPipe[0]);
+    close(lPipe[1]);
+    OsThrowError<QNCOsException>(lErrno, "fcntl O_NONBLOCK");
+  }
+  arReadFd = lPipe[0];
+  arWriteFd = lPipe[1];
+}
+
 void OsSetNonBlocking(int aFd) {
   const int lFlags = fcntl(aFd, F_GETFL);
   if (lFlags < 0 || fcntl(aFd, F_SETFL, lFlags | O_NONBLOCK) != 0)

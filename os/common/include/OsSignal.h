@@ -15,8 +15,3 @@ int OsSetSignalHandler(int aSignal, void (*apHandler)(int)) noexcept;
 // process ends (or stops) exactly as it would have without the handler; a fault that re-executes
 // on return dies the same way.
 void OsRaiseWithDefaultAction(int aSignal) noexcept;
-
-// Creates a pipe for signal numbers: both ends close on exec; the write end does not block, so a
-// handler writing into a full pipe loses that byte instead of hanging the interrupted thread.
-// Throws QNCOsException naming the failing call.
-void OsCreateSignalPipe(int& arReadFd, int& arWriteFd);

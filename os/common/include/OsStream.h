@@ -4,6 +4,11 @@
 // everywhere; no call raises SIGPIPE unless told to (QNPS_Raise). Failures name the descriptor,
 // with its path when the system still knows it (OsError.h).
 
+// Creates a pipe whose two ends close on exec and whose write end does not block: a writer that
+// finds it full (a signal handler, a daemon whose starting command stopped reading) loses those
+// bytes instead of stalling. Throws QNCOsException naming the failing call.
+void OsOpenWakePipe(int& arReadFd, int& arWriteFd);
+
 // Puts the descriptor into non-blocking mode. Throws QNCOsException.
 void OsSetNonBlocking(int aFd);
 
