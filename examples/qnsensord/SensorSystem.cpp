@@ -78,36 +78,14 @@ void QNCSensorSystem::processCommandLine(int argc, char** argv) {
   QN_ENTERED();
   try {
     QNCSystem::processCommandLine(argc, argv);
-    QNCPointer<QNCCommandLineArgument> lArgument;
-    bool lGiven = true;
-    try {
-      mCommandLineParser->getArgument("-n", lArgument);
-    } catch (QNCNotFoundEx&) {
-      lGiven = false;
-    }
-    if (lGiven && mSettings.contains("ConfigFile"))
-      throw QNCInvalidEx("Option '-n' cannot be combined with -c: set ChannelCount in the file", 6);
-    if (!lGiven) {
-      // With -c the file decides (parseConfigFile); without, the default applies.
-      if (!mSettings.contains("ConfigFile")) _addChannelCount(kDefaultChannelCount);
-    } else {
-      QNCOptionValueArgument* lpArg = dynamic_cast<QNCOptionValueArgument*>(lArgument.get());
-      QN_ASSERT(NULL != lpArg);
-      QNCMultiType lCount(0u);
-      try {
-        lCount.decode(lpArg->getValue());
-      } catch (const QNCInvalidEx&) {
-        lCount.set(0u);  // not a number: reported below like any count out of range
-      }
-      if (!isChannelCount(lCount)) {
-        char lMessage[QNCException::kMaxMessage];
-        snprintf(lMessage, sizeof lMessage, "Option '-n' expects a channel count from 1 to %u, got '%s'",
-                 kMaxChannelCount, lpArg->getValue().get());
-        throw QNCInvalidEx(lMessage, 6);
-      }
-      _addChannelCount(lCount);
-    }
-    _processIdleLimit();
+    // With -c the file sets the channel count (parseConfigFile); -n beside it is refused.
+    const bool lFromFile = mSettings.contains("ConfigFile");
+    unsigned int lCount = kDefaultChannelCount;
+    const char* lpRefusal =
+        lFromFile ? "Option '-n' cannot be combined with -c: set ChannelCount in the file" : nullptr;
+    const bool lGiven = _optionInRange("-n", "a channel count", kMaxChannelCount, lCount, lpRefusal);
+    if (lGiven || !lFromFile) _addChannelCount(lCount);
+    (void)_optionInRange("-t", "seconds", 3600, mIdleLimit);  // absent: the default stays
   } catch (const QNCUsageEx&) {
     throw;
   } catch (const QNCInvalidEx& acrException) {
@@ -116,28 +94,31 @@ void QNCSensorSystem::processCommandLine(int argc, char** argv) {
   QN_LEFT();
 }
 
-void QNCSensorSystem::_processIdleLimit() {
+bool QNCSensorSystem::_optionInRange(const char* apOption, const char* apWhat, unsigned int aMax,
+                                     unsigned int& arValue, const char* apRefusal) {
   QNCPointer<QNCCommandLineArgument> lArgument;
   try {
-    mCommandLineParser->getArgument("-t", lArgument);
+    mCommandLineParser->getArgument(apOption, lArgument);
   } catch (QNCNotFoundEx&) {
-    return;  // the default stays
+    return false;
   }
+  if (apRefusal != nullptr) throw QNCInvalidEx(apRefusal, 6);
   QNCOptionValueArgument* lpArg = dynamic_cast<QNCOptionValueArgument*>(lArgument.get());
   QN_ASSERT(NULL != lpArg);
-  QNCMultiType lSeconds(0u);
+  QNCMultiType lValue(0u);
   try {
-    lSeconds.decode(lpArg->getValue());
+    lValue.decode(lpArg->getValue());
   } catch (const QNCInvalidEx&) {
-    lSeconds.set(0u);  // not a number: reported below like any value out of range
+    lValue.set(0u);  // not a number: reported below like any value out of range
   }
-  if (static_cast<unsigned int>(lSeconds) < 1 || static_cast<unsigned int>(lSeconds) > 3600) {
+  if (static_cast<unsigned int>(lValue) < 1 || static_cast<unsigned int>(lValue) > aMax) {
     char lMessage[QNCException::kMaxMessage];
-    snprintf(lMessage, sizeof lMessage, "Option '-t' expects seconds from 1 to 3600, got '%s'",
-             lpArg->getValue().get());
+    snprintf(lMessage, sizeof lMessage, "Option '%s' expects %s from 1 to %u, got '%s'", apOption, apWhat,
+             aMax, lpArg->getValue().get());
     throw QNCInvalidEx(lMessage, 6);
   }
-  mIdleLimit = lSeconds;
+  arValue = lValue;
+  return true;
 }
 
 void QNCSensorSystem::setCommandLineArgumentDesc() {

@@ -57,7 +57,11 @@ class QNCSensorSystem : public QNCSystem {
 
  private:
   void _addChannelCount(unsigned int aCount);
-  void _processIdleLimit();
+  // The value of option apOption (1 to aMax) in arValue; false, arValue untouched, when the option
+  // was not given. Throws QNCInvalidEx "Option '<o>' expects <apWhat> from 1 to <aMax>, got '<v>'",
+  // or with the text apRefusal (when not null) as soon as the option was given at all.
+  bool _optionInRange(const char* apOption, const char* apWhat, unsigned int aMax, unsigned int& arValue,
+                      const char* apRefusal = nullptr);
 
   QNCVector<QNCPointer<QNCSensorChannel>> mChannels;
   QNCSensorStatistics mStatistics;
