@@ -5,7 +5,7 @@
 # temporary directory.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-scripts/ensure-deps.sh
+scripts/ensure-deps.sh bench
 
 cmake -S . -B build/bench -DCMAKE_BUILD_TYPE=Release -DQN_BUILD_TESTS=OFF -DQN_BUILD_BENCH=ON >/dev/null
 cmake --build build/bench -j"$(nproc)"
