@@ -8,7 +8,9 @@
 // -x first opens one more connection that sends half a message and disconnects.
 // Every answer must carry the sequence number of the reading just sent (so each reading is
 // answered exactly once and in order) and accept or refuse it as expected. Prints readings/s,
-// round-trip latency at p50 and p99, and the count of errors; exits 0 only when there are none.
+// round-trip latency at p50 and p99, and the count of errors, then the same figures on one line
+// for scripts ("figures: readings_per_s=<n> p50_us=<n> p99_us=<n> errors=<n>"); exits 0 only
+// when there are no errors.
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -241,14 +243,16 @@ int main(int argc, char** argv) {
   const unsigned int lMissing = lOptions.mReadings - (lAccepted + lRefused);
   if (lRefused != lOptions.mMalformed) lErrors += 1;
   if (lMissing != 0) lErrors += 1;
+  const double lRate = lSeconds > 0 ? (lAccepted + lRefused) / lSeconds : 0.0;
+  const double lP50 = percentile(lLatencies, 0.50);
+  const double lP99 = percentile(lLatencies, 0.99);
   printf("qnsensor-feed: %u readings over %u connections (%u channels)\n", lOptions.mReadings,
          lOptions.mConnections, lOptions.mChannels);
   printf("  answered: %u accepted, %u refused (%u malformed sent), %u missing\n", lAccepted, lRefused,
          lOptions.mMalformed, lMissing);
-  printf("  rate: %.0f readings/s over %.2f s\n", lSeconds > 0 ? (lAccepted + lRefused) / lSeconds : 0.0,
-         lSeconds);
-  printf("  round trip: p50 %.0f us, p99 %.0f us\n", percentile(lLatencies, 0.50),
-         percentile(lLatencies, 0.99));
+  printf("  rate: %.0f readings/s over %.2f s\n", lRate, lSeconds);
+  printf("  round trip: p50 %.0f us, p99 %.0f us\n", lP50, lP99);
   printf("  errors: %u (%u readings sent)\n", lErrors, lSent);
+  printf("figures: readings_per_s=%.1f p50_us=%.1f p99_us=%.1f errors=%u\n", lRate, lP50, lP99, lErrors);
   return lErrors == 0 ? 0 : 1;
 }
