@@ -5,7 +5,8 @@ Every round starts qnsensord in the foreground (-D false) once per log mask, in 
 directory, and
   - times the start-up: from the moment just before the process is spawned (posix_spawn, so the
     figure includes exec and loading the libraries) to the time stamp of its "qnsensord running"
-    log line, which the service writes once its sockets listen and every thread runs; and, read
+    log line, which the service writes once its sockets listen and every thread runs; the part
+    of it from the log's first line (written first thing in main) to "running"; and, read
     from /proc/<pid>/task/*/schedstat as soon as the line is seen, the CPU time its threads used
     by then and the time they spent runnable but waiting for a CPU (what a busy machine adds);
   - runs qnsensor-feed against it with 1, 2 and 8 connections (in an order shuffled per round),
@@ -16,8 +17,8 @@ The masks are taken in alternating order, so both see the same machine state ove
 
 Writes the rounds as Google Benchmark JSON (one "iteration" entry per round and case), named
 Service/<N>conn_mask<M>/ours (items_per_second = readings/s, counters p50_us, p99_us,
-log_bytes_per_item) and Service/startup_mask<M>/ours (real_time in ms, counters cpu_ms and
-wait_ms), so the report generator
+log_bytes_per_item) and Service/startup_mask<M>/ours (real_time in ms, counters main_ms,
+cpu_ms and wait_ms), so the report generator
 reads them like every other benchmark. Exits non-zero, saying why, if the service fails to
 start, the feed reports an error, or the service does not stop cleanly.
 """
@@ -35,7 +36,9 @@ import sys
 import tempfile
 import time
 
-RUNNING_LINE = re.compile(rb"^(\d{4}-\d\d-\d\d \d\d:\d\d:\d\d\.\d{6}) -N- .*qnsensord running", re.M)
+STAMP = rb"(\d{4}-\d\d-\d\d \d\d:\d\d:\d\d\.\d{6})"
+RUNNING_LINE = re.compile(rb"^" + STAMP + rb" -N- .*qnsensord running", re.M)
+FIRST_LINE = re.compile(rb"^" + STAMP + rb" ")
 FIGURES_LINE = re.compile(r"^figures: readings_per_s=(\S+) p50_us=(\S+) p99_us=(\S+) errors=(\d+)$", re.M)
 CONNECTIONS = (1, 2, 8)
 MASKS = (127, 255)
@@ -46,16 +49,22 @@ def fail(message):
     sys.exit("service.py: " + message)
 
 
+def stamp_of(match):
+    """The log's local time stamp as seconds since the epoch (this process reads local time too)."""
+    return datetime.datetime.strptime(match.group(1).decode(), "%Y-%m-%d %H:%M:%S.%f").timestamp()
+
+
 def wait_for_running(pid, log_path, timeout_s=10.0):
-    """Returns the time stamp (seconds since the epoch) of the "running" line."""
+    """Returns the time stamps of the log's first line (written first thing in main) and of the
+    "running" line."""
     deadline = time.monotonic() + timeout_s
     while time.monotonic() < deadline:
         try:
             with open(log_path, "rb") as log:
-                match = RUNNING_LINE.search(log.read())
+                text = log.read()
+            match = RUNNING_LINE.search(text)
             if match:
-                stamp = datetime.datetime.strptime(match.group(1).decode(), "%Y-%m-%d %H:%M:%S.%f")
-                return stamp.timestamp()  # the service writes local time, as this process reads it
+                return stamp_of(FIRST_LINE.match(text)), stamp_of(match)
         except FileNotFoundError:
             pass
         done, status = os.waitpid(pid, os.WNOHANG)
@@ -91,9 +100,10 @@ def start_service(build, mask, log_dir):
     before = time.time()
     pid = os.posix_spawn(program, args, env, file_actions=actions)
     os.close(devnull)
-    running = wait_for_running(pid, os.path.join(log_dir, "qnsensord.log"))
+    first, running = wait_for_running(pid, os.path.join(log_dir, "qnsensord.log"))
     cpu_ms, wait_ms = scheduler_times_ms(pid)
-    return pid, (running - before) * 1000.0, cpu_ms, wait_ms
+    return pid, {"real_time": (running - before) * 1000.0, "main_ms": (running - first) * 1000.0,
+                 "cpu_ms": cpu_ms, "wait_ms": wait_ms}
 
 
 def stop_service(build, pid, log_dir):
@@ -136,9 +146,9 @@ def main():
         for mask in MASKS if round_index % 2 == 0 else reversed(MASKS):
             log_dir = tempfile.mkdtemp(prefix="qnsensord-bench.")
             try:
-                pid, startup_ms, cpu_ms, wait_ms = start_service(options.build, mask, log_dir)
-                runs.append(entry(f"Service/startup_mask{mask}/ours", round_index, real_time=startup_ms,
-                                  cpu_time=cpu_ms, time_unit="ms", cpu_ms=cpu_ms, wait_ms=wait_ms))
+                pid, startup = start_service(options.build, mask, log_dir)
+                runs.append(entry(f"Service/startup_mask{mask}/ours", round_index, cpu_time=startup["cpu_ms"],
+                                  time_unit="ms", **startup))
                 log_path = os.path.join(log_dir, "qnsensord.log")
                 for connections in random.sample(CONNECTIONS, len(CONNECTIONS)):
                     size_before = os.path.getsize(log_path)

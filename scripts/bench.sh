@@ -8,6 +8,7 @@
 #   scripts/bench.sh [benchmark arguments...]
 #
 # Extra arguments go to every benchmark program (for a trial, e.g. --benchmark_filter=Logger).
+# A benchmark without its own MinTime or Iterations runs each repetition for about 0.1 s.
 # Environment: ROUNDS (default 9), SERVICE_READINGS (readings per feed run, default 5000),
 # BENCH_OUT (the file to write, default docs/BENCHMARKS.md), SKIP_SERVICE=1 to leave the service out.
 set -euo pipefail
@@ -33,8 +34,8 @@ for bench in "$build"/bench/*Bench; do
   echo "=== $name"
   start=$(date +%s)
   "$bench" --benchmark_repetitions="$rounds" --benchmark_enable_random_interleaving=true \
-    --benchmark_display_aggregates_only=true --benchmark_out="$work/results/$name.json" \
-    --benchmark_out_format=json "$@"
+    --benchmark_min_time=0.1 --benchmark_display_aggregates_only=true \
+    --benchmark_out="$work/results/$name.json" --benchmark_out_format=json "$@"
   echo "=== $name: $(($(date +%s) - start)) s"
   rm -rf "${QN_LOG_DIR:?}"/*
 done
