@@ -31,7 +31,8 @@ AREAS = ("Logger", "HandOff", "Pool", "Framing", "Service")
 PRIMARY = {"HandOff": ("ours_exit", "ours"), "default": ("ours",)}
 CONTENDER_ORDER = ("ours", "ours_exit", "ours_parts", "floor", "spdlog_sync", "spdlog_async",
                    "std_queue", "moodycamel", "malloc", "raw")
-SUFFIX = re.compile(r"^(threads|iterations|repeats|min_time|min_warmup_time):.*$|^(real_time|manual_time|process_time)$")
+SUFFIX = re.compile(r"^(threads|iterations|repeats|min_time|min_warmup_time):.*$"
+                    r"|^(real_time|manual_time|process_time)$")
 
 # The targets. Each is checked on the medians of the per-round ratios.
 #   ratio: primary / contender >= minimum, at every listed case (None: every case of the area)
@@ -59,7 +60,6 @@ class Series:
     def __init__(self):
         self.rounds = {}  # repetition index -> value
         self.higher_is_better = True
-        self.unit = "items/s"
         self.counters = defaultdict(dict)  # counter name -> {round: value}
 
     def median(self):
@@ -92,11 +92,17 @@ def load(results_dir):
             data = json.load(source)
         program = os.path.basename(path)[:-5]
         contexts[program] = data.get("context", {})
+        runs = [run for run in data.get("benchmarks", []) if not run.get("error_occurred")]
+        # Per repetition where the program wrote them; a program run with aggregates only
+        # contributes its median as a single round.
+        repeated = {run.get("run_name") or run["name"] for run in runs
+                    if run.get("run_type", "iteration") == "iteration"}
         next_round = defaultdict(int)
-        for run in data.get("benchmarks", []):
-            if run.get("run_type", "iteration") != "iteration" or run.get("error_occurred"):
-                continue
+        for run in runs:
             name = run.get("run_name") or run["name"]
+            if run.get("run_type", "iteration") != "iteration" and (
+                    name in repeated or run.get("aggregate_name") != "median"):
+                continue
             key = split_name(name)
             if key:
                 series = areas[key[0]][key[1]].setdefault(key[2], Series())
@@ -108,7 +114,6 @@ def load(results_dir):
                 series.rounds[index] = float(run["items_per_second"])
             else:
                 series.higher_is_better = False
-                series.unit = "s"
                 series.rounds[index] = float(run["real_time"]) * TIME_UNITS.get(run.get("time_unit", "ns"), 1e-9)
             for counter in ("p50_us", "p99_us", "log_bytes_per_item", "main_ms", "cpu_ms", "wait_ms"):
                 if counter in run:
@@ -315,14 +320,16 @@ def service_table(cases):
             summary.append(("Service", f"start-up at mask {mask}", text, figure(series), met))
     costs = []
     for connections in sorted(loads):
-        if 127 in loads[connections] and 255 in loads[connections]:
-            result = ratio(loads[connections][255], loads[connections][127])
-            if result:
-                costs.append((connections, result[0]))
+        with_trace, without = loads[connections].get(255), loads[connections].get(127)
+        result = ratio(with_trace, without) if with_trace and without else None
+        if result:
+            p50 = [series.counter_median("p50_us") for series in (with_trace, without)]
+            slower = f", p50 round trip {p50[0] / p50[1]:.2f}x as long" if None not in p50 and p50[1] > 0 else ""
+            costs.append(f"{connections} connection{'s' if connections > 1 else ''}: {result[0]:.2f}x the "
+                         f"readings/s{slower}")
     if costs:
-        lines += ["", "Trace logging (mask 255) against mask 127, readings/s: " +
-                  ", ".join(f"{ratio_value:.2f}x with {connections} connection{'s' if connections > 1 else ''}"
-                            for connections, ratio_value in costs) + "."]
+        lines += ["", "What trace logging costs a user: the service at mask 255 (every level) against mask 127 "
+                  "(every level but trace), medians over the rounds; " + "; ".join(costs) + "."]
     return lines, summary
 
 
