@@ -379,7 +379,8 @@ def machine_lines(build_dir, command, contexts):
         f"- Compiler: {compiler or 'unknown'}",
         f"- Flags: `{flags or 'unknown'}`",
         f"- Google Benchmark {gbench}; peers: spdlog {spdlog}, concurrentqueue {queue} (Debian packages)",
-        f"- Date: {datetime.datetime.now(datetime.timezone.utc).strftime('%Y-%m-%d %H:%M UTC')}",
+        f"- Date: {datetime.datetime.now(datetime.timezone.utc).strftime('%Y-%m-%d %H:%M UTC')}; load average "
+        f"at the end of the run (1, 5, 15 min): {', '.join(f'{value:.2f}' for value in os.getloadavg())}",
         f"- Command: `{command}`",
     ]
 
