@@ -124,8 +124,8 @@ def load(results_dir):
 def ratio(ours, other):
     """Median and (min, max) of ours/other per round (inverted for times), or None."""
     rounds = sorted(set(ours.rounds) & set(other.rounds))
-    if not rounds:
-        return None
+    if not rounds or ours.higher_is_better != other.higher_is_better:
+        return None  # a rate against a time has no ratio
     values = []
     for index in rounds:
         a, b = ours.rounds[index], other.rounds[index]
@@ -220,7 +220,7 @@ def check_targets(areas):
                 if floor_result is not None:
                     floor_met = floor_result[0] >= target["floor_minimum"]
                     met = floor_met or bool(met)
-                    marks[(target["area"], case, "floor")] = (f">= {target['floor_minimum']:.2f} (or the above)",
+                    marks[(target["area"], case, "floor")] = (f">= {target['floor_minimum']:.2f}, or the {target['contender']} target",
                                                               met, floor_result)
                     what += " (or / floor)"
                     shown += f"; / floor {measured(floor_result)}"
