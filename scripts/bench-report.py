@@ -203,7 +203,10 @@ def check_targets(areas):
             summary.append((target["area"], f"{name_a or 'ours'} at {target['case_a']} / at {target['case_b']}",
                             text, measured(result), met))
             continue
-        cases = target["cases"] or sorted(area)
+        cases = target["cases"] or sorted(area, key=case_key)
+        if not cases:
+            summary.append((target["area"], f"every case: ours / {target['contender']}",
+                            f">= {target['minimum']:.2f}", measured(None), None))
         for case in cases:
             contenders = area.get(case, {})
             name = primary_of(target["area"], contenders)
