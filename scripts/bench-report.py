@@ -204,7 +204,8 @@ def check_targets(areas):
                             text, measured(result), met))
             continue
         # Without a list: every case that has the contender (a case without a floor has no floor target).
-        cases = target["cases"] or sorted((case for case in area if target["contender"] in area[case]), key=case_key)
+        cases = target["cases"] or sorted((case for case in area if target["contender"] in area[case]),
+                                          key=case_key)
         if not cases:
             summary.append((target["area"], f"every case: ours / {target['contender']}",
                             f">= {target['minimum']:.2f}", measured(None), None))
@@ -224,8 +225,8 @@ def check_targets(areas):
                 if floor_result is not None:
                     floor_met = floor_result[0] >= target["floor_minimum"]
                     met = floor_met or bool(met)
-                    marks[(target["area"], case, "floor")] = (f">= {target['floor_minimum']:.2f}, or the {target['contender']} target",
-                                                              met, floor_result)
+                    floor_text = f">= {target['floor_minimum']:.2f}, or the {target['contender']} target"
+                    marks[(target["area"], case, "floor")] = (floor_text, met, floor_result)
                     what += " (or / floor)"
                     shown += f"; / floor {measured(floor_result)}"
             marks[(target["area"], case, target["contender"])] = (text, met, result)
