@@ -10,7 +10,9 @@
 # Extra arguments go to every benchmark program (for a trial, e.g. --benchmark_filter=Logger).
 # A benchmark without its own MinTime or Iterations runs each repetition for about 0.1 s.
 # Environment: ROUNDS (default 9), SERVICE_READINGS (readings per feed run, default 5000),
-# BENCH_OUT (the file to write, default docs/BENCHMARKS.md), SKIP_SERVICE=1 to leave the service out.
+# BENCH_OUT (the file to write, default docs/BENCHMARKS.md), SKIP_SERVICE=1 to leave the service out,
+# RESULTS_DIR (keep the run's JSON files there; after editing docs/benchmarks-notes.md, rerun only
+# scripts/bench-report.py on them, with the command the run printed).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/ensure-deps.sh bench
@@ -24,7 +26,8 @@ cmake --build "$build" -j"$(nproc)"
 
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
-mkdir "$work/results" "$work/logs"
+results=${RESULTS_DIR:-$work/results}
+mkdir -p "$results" "$work/logs"
 export QN_LOG_DIR="$work/logs"
 
 start_all=$(date +%s)
@@ -35,23 +38,26 @@ for bench in "$build"/bench/*Bench; do
   start=$(date +%s)
   "$bench" --benchmark_repetitions="$rounds" --benchmark_enable_random_interleaving=true \
     --benchmark_min_time=0.1 --benchmark_display_aggregates_only=true \
-    --benchmark_out="$work/results/$name.json" --benchmark_out_format=json "$@"
+    --benchmark_out="$results/$name.json" --benchmark_out_format=json "$@"
   echo "=== $name: $(($(date +%s) - start)) s"
   rm -rf "${QN_LOG_DIR:?}"/*
 done
 if [ "${SKIP_SERVICE:-0}" != 1 ]; then
   echo "=== service"
   start=$(date +%s)
-  python3 bench/service.py --build "$build" --out "$work/results/Service.json" --rounds "$rounds" \
+  python3 bench/service.py --build "$build" --out "$results/Service.json" --rounds "$rounds" \
     --readings "${SERVICE_READINGS:-5000}"
   echo "=== service: $(($(date +%s) - start)) s"
 fi
 echo "=== all: $(($(date +%s) - start_all)) s"
+cp /proc/loadavg "$results/loadavg"  # how busy the machine was, for the report
 
 command="scripts/bench.sh"
 [ $# -eq 0 ] || command+=" $*"
 [ "$rounds" = 9 ] || command="ROUNDS=$rounds $command"
 [ -z "${SERVICE_READINGS:-}" ] || command="SERVICE_READINGS=$SERVICE_READINGS $command"
-python3 scripts/bench-report.py --results "$work/results" --build "$build" --notes docs/benchmarks-notes.md \
-  --out "$out" --command "$command" --rounds "$rounds"
+report=(python3 scripts/bench-report.py --results "$results" --build "$build" --notes docs/benchmarks-notes.md
+  --out "$out" --command "$command" --rounds "$rounds")
+"${report[@]}"
 echo "wrote $out"
+[ -z "${RESULTS_DIR:-}" ] || echo "regenerate with: $(printf '%q ' "${report[@]}")"
