@@ -68,6 +68,17 @@ bool lockWithin50Ms(std::mutex& arLock) {
   return false;
 }
 
+// A line is copied under mLock in a few dozen nanoseconds, so a thread that finds the lock taken
+// spins for a few microseconds at most before it sleeps in the kernel: sleeping and being woken
+// would cost both threads far more than the wait.
+void lockSpinning(std::mutex& arLock) {
+  for (int lTry = 0; lTry < 100; ++lTry) {
+    if (arLock.try_lock()) return;
+    __builtin_ia32_pause();
+  }
+  arLock.lock();
+}
+
 const int gsCrashSignals[] = {SIGSEGV, SIGBUS, SIGABRT, SIGFPE};
 
 void onCrashSignal(int aSignal) {
@@ -98,7 +109,8 @@ void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) 
   const bool lUrgent = isUrgent(aLevel);
   const bool lJournal = mJournal.load(std::memory_order_relaxed);
   if (lJournal) writeToJournal(aLevel, apLine, aLength);
-  std::unique_lock<std::mutex> lGuard(mLock);
+  lockSpinning(mLock);
+  std::unique_lock<std::mutex> lGuard(mLock, std::adopt_lock);
   if (mState != QNSS_Open) {
     if (mState == QNSS_Memory) mStartup.keep(aLevel, apLine, aLength);
     // Under the lock, so that urgent lines of several threads reach standard error whole. The
@@ -116,7 +128,9 @@ void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) 
   memcpy(mpActive + mUsed, apLine, aLength);
   mUsed += aLength;
   const bool lWriteNow = lUrgent || mWriteThrough;
-  const bool lWakeFlusher = lWasEmpty && mFlusherRunning;
+  // An urgent line writes the batch itself; the flusher stays idle, and the next line wakes it.
+  const bool lWakeFlusher = !lWriteNow && lWasEmpty && mFlusherIdle;
+  if (lWakeFlusher) mFlusherIdle = false;
   lGuard.unlock();
   if (lWriteNow) {
     _writeBatch();
@@ -247,7 +261,9 @@ void QNCLogSink::_startFlusher() {
 void QNCLogSink::_runFlusher() {
   std::unique_lock<std::mutex> lGuard(mLock);
   for (;;) {
+    mFlusherIdle = true;
     mFlusherWake.wait(lGuard, [this] { return mStopFlusher || mUsed != 0; });
+    mFlusherIdle = false;
     if (mStopFlusher) return;
     // Let a batch gather, so that a steady trickle of lines costs one write per period.
     mFlusherWake.wait_for(lGuard, kFlushDelay, [this] { return mStopFlusher; });
@@ -293,6 +309,7 @@ void QNCLogSink::__forkChild() {
     lrSink.mWriteThrough = true;
   }
   lrSink.mFlusherRunning = false;
+  lrSink.mFlusherIdle = false;
   lrSink.mStopFlusher = false;
   lrSink.mLock.unlock();
   lrSink.mWriteLock.unlock();

@@ -16,7 +16,9 @@
 // copies of concurrent lines never tear there either. While it is off the cost is one relaxed load.
 //
 // Any thread, at any time. write() blocks only for the copy, or for a batch write when the batch is
-// full or the line is urgent.
+// full or the line is urgent. A writer that finds mLock taken spins for a few microseconds before
+// it sleeps, since the copy it waits for takes nanoseconds; the flusher is woken only when it waits
+// for a first line, not for every line.
 
 #include <atomic>
 #include <condition_variable>
@@ -87,6 +89,7 @@ class QNCLogSink {
   bool mWriteThrough = false;    // after the exit handler, in a child of fork: lines written at once
   bool mFlusherRunning = false;  // a flusher thread exists in this process
   bool mStopFlusher = false;
+  bool mFlusherIdle = false;  // the flusher waits for a first line; only then is it woken
   // Joinable only while mFlusherRunning in the process that started it: a child of fork inherits
   // the object but not the thread, and neither joins nor replaces it (it never starts a flusher).
   std::thread mFlusher;
