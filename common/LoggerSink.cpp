@@ -74,7 +74,9 @@ bool lockWithin50Ms(std::mutex& arLock) {
 void lockSpinning(std::mutex& arLock) {
   for (int lTry = 0; lTry < 100; ++lTry) {
     if (arLock.try_lock()) return;
-    __builtin_ia32_pause();
+#if defined(__x86_64__) || defined(__i386__)
+    __builtin_ia32_pause();  // lets the other hyper-thread run and the holder's unlock through
+#endif
   }
   arLock.lock();
 }
