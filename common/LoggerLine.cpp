@@ -43,7 +43,17 @@ char* putText(char* apOut, const char* apEnd, const char* apText) {
 }
 
 char* putUnsigned(char* apOut, const char* apEnd, unsigned long aValue, int aMinDigits) {
-  char lDigits[24];
+  int lWidth = 1;
+  for (unsigned long lRest = aValue / 10; lRest != 0; lRest /= 10) ++lWidth;
+  if (lWidth < aMinDigits) lWidth = aMinDigits;
+  if (lWidth <= apEnd - apOut) {
+    // Straight into the line: digits stored bytewise and then read back in wider words would stall
+    // the processor on every line.
+    for (char* lpDigit = apOut + lWidth; lpDigit != apOut; aValue /= 10)
+      *--lpDigit = static_cast<char>('0' + aValue % 10);
+    return apOut + lWidth;
+  }
+  char lDigits[24];  // the line is being cut: its leading digits, as many as fit
   int lCount = 0;
   do {
     lDigits[sizeof lDigits - 1 - lCount++] = static_cast<char>('0' + aValue % 10);
