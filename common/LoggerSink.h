@@ -97,7 +97,7 @@ class QNCLogSink {
     std::atomic<bool> mTaken{false};
   };
 
-  // On a cache line of their own, with the lock: the members every line touches.
+  // The members every line touches share one cache line with the lock.
   alignas(64) QNCLineLock mLock;  // guards every member below; mState and mFd are written under both locks
   QNESinkState mState = QNSS_Memory;
   int mFd = -1;
