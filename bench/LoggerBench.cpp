@@ -1,21 +1,26 @@
-// The logger is the library's hottest path: every operation logs "Entered" and "Left" and the
-// default mask writes them. Measured here, in one run:
-//   BM_Logger_TraceLine          lines/s through the logger with the default mask, to a file
-//   BM_Baseline_WritePerLine     lines/s of the naive logger: format the same line, one write() each
-//   BM_Logger_MaskedOffTrace     the cost of a trace call whose level is masked off
-// The ratio of the first two (items_per_second) is the figure that matters; both run with 1 and 2
-// threads.
+// Logging to a file: the logger against spdlog, the library a user would pick instead.
+//
+//   Logger/<threads>/ours          PrintLogMessageWithTimeStamp behind the QN_LOG_TRACE test
+//   Logger/<threads>/spdlog_sync   spdlog's basic_logger_mt (a mutex and a FILE per logger)
+//   Logger/<threads>/spdlog_async  spdlog's async logger (a queue and one worker) on a file sink
+//   Logger/maskedoff/{ours,spdlog} a trace call whose level is masked off
+//
+// Every contender writes the same 126-byte line (time to the microsecond, tag, thread id, function,
+// file, source line, "Entered"), so the volume in bytes is the same. One iteration is a round of
+// kRoundLines lines per thread that ends when every line of the round is in the file (handed to
+// the kernel): ours with flushLogger(), spdlog sync with flush() (fflush of its FILE), spdlog
+// async with flush() and then waiting until its worker has carried out that flush, which it does
+// after every line queued before it. Throughput is lines/s of all threads together.
 
 #include <benchmark/benchmark.h>
-#include <fcntl.h>
-#include <sys/syscall.h>
-#include <sys/time.h>
-#include <time.h>
+#include <spdlog/async.h>
+#include <spdlog/sinks/basic_file_sink.h>
+#include <spdlog/spdlog.h>
 #include <unistd.h>
 
-#include <cstdarg>
-#include <cstdio>
+#include <condition_variable>
 #include <cstdlib>
+#include <memory>
 #include <mutex>
 #include <string>
 
@@ -25,89 +30,166 @@
 
 namespace {
 
-// Both files live in one fresh directory; each run starts them empty so the disk does not fill.
-struct BenchFiles {
-  std::string mLog;
-  std::string mBaseline;
-  int mBaselineFd = -1;
+constexpr int kRoundLines = 10000;
+
+// The call site every contender logs from; with a 4-digit thread id each line is 126 bytes.
+constexpr const char* kFunction = "acquireSensorSampleBatch";
+constexpr const char* kFile = "examples/qnsensord/SensorSampleSourceReader.cpp";
+constexpr unsigned int kLine = 2148;
+
+// A second sink of the async logger that takes no lines (its level is off) and counts the flushes
+// spdlog's worker makes: the worker flushes its sinks in order, the file first, and only after
+// every line queued before the flush request.
+class QNCFlushCounter : public spdlog::sinks::base_sink<spdlog::details::null_mutex> {
+ public:
+  QNCFlushCounter() { set_level(spdlog::level::off); }
+  // Requests a flush and waits until the worker has made it. Requests are numbered in the order
+  // they enter the queue, which is the order the worker makes them.
+  void flushAndWait(spdlog::async_logger& arLogger) {
+    unsigned long lTicket = 0;
+    {
+      std::lock_guard<std::mutex> lPostGuard(mPostLock);
+      lTicket = ++mRequested;
+      arLogger.flush();
+    }
+    std::unique_lock<std::mutex> lGuard(mLock);
+    mFlushed.wait(lGuard, [&] { return mFlushes >= lTicket; });
+  }
+
+ protected:
+  void sink_it_(const spdlog::details::log_msg&) override {}
+  void flush_() override {
+    std::lock_guard<std::mutex> lGuard(mLock);
+    ++mFlushes;
+    mFlushed.notify_all();
+  }
+
+ private:
+  std::mutex mPostLock;  // guards mRequested and the order of flush requests
+  unsigned long mRequested = 0;
+  std::mutex mLock;  // guards mFlushes
+  std::condition_variable mFlushed;
+  unsigned long mFlushes = 0;
 };
 
-BenchFiles& files() {
-  static BenchFiles sFiles;
-  static std::once_flag sOnce;
-  std::call_once(sOnce, [] {
-    char lTemplate[] = "/tmp/qnbench.XXXXXX";
-    if (mkdtemp(lTemplate) == nullptr) abort();
-    sFiles.mLog = std::string(lTemplate) + "/logger.log";
-    sFiles.mBaseline = std::string(lTemplate) + "/baseline.log";
-    sFiles.mBaselineFd = open(sFiles.mBaseline.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-    if (sFiles.mBaselineFd < 0) abort();
-    CreateLogger(sFiles.mLog.c_str());
-  });
-  return sFiles;
+struct QNSBenchFiles {
+  std::string mOurs, mSync, mAsync;
+  std::shared_ptr<spdlog::logger> mpSync;
+  std::shared_ptr<spdlog::async_logger> mpAsync;
+  std::shared_ptr<QNCFlushCounter> mpAsyncFlushes;
+};
+
+QNSBenchFiles& files() {
+  static QNSBenchFiles* const spFiles = [] {
+    auto* lpFiles = new QNSBenchFiles;
+    const char* lpDir = getenv("QN_LOG_DIR");
+    std::string lDir = lpDir != nullptr ? lpDir : "";
+    if (lDir.empty()) {
+      char lTemplate[] = "/tmp/qnbench.XXXXXX";
+      if (mkdtemp(lTemplate) == nullptr) abort();
+      lDir = lTemplate;
+    }
+    lpFiles->mOurs = lDir + "/ours.log";
+    lpFiles->mSync = lDir + "/spdlog_sync.log";
+    lpFiles->mAsync = lDir + "/spdlog_async.log";
+    CreateLogger(QNCString(lpFiles->mOurs.c_str()));
+    const char* lpPattern = "%Y-%m-%d %H:%M:%S.%f -T- [%t] %! (%g:%#) %v";
+    lpFiles->mpSync = spdlog::basic_logger_mt("sync", lpFiles->mSync);
+    lpFiles->mpSync->set_pattern(lpPattern);
+    lpFiles->mpSync->set_level(spdlog::level::trace);
+    spdlog::init_thread_pool(8192, 1);  // spdlog's default queue and one worker
+    lpFiles->mpAsyncFlushes = std::make_shared<QNCFlushCounter>();
+    const spdlog::sinks_init_list lSinks{std::make_shared<spdlog::sinks::basic_file_sink_st>(lpFiles->mAsync),
+                                         lpFiles->mpAsyncFlushes};
+    lpFiles->mpAsync = std::make_shared<spdlog::async_logger>("async", lSinks, spdlog::thread_pool(),
+                                                              spdlog::async_overflow_policy::block);
+    lpFiles->mpAsync->set_pattern(lpPattern);
+    lpFiles->mpAsync->set_level(spdlog::level::trace);
+    return lpFiles;
+  }();
+  return *spFiles;
 }
 
-void startEmpty(const benchmark::State& acrState) {
-  if (acrState.thread_index() != 0) return;
-  // Both files are appended to, so cutting them to nothing is safe while they stay open.
-  (void)!truncate(files().mLog.c_str(), 0);
-  (void)!truncate(files().mBaseline.c_str(), 0);
+// Each run starts its file empty so that the disk does not fill; every file is opened for
+// appending, so cutting it while it stays open is safe. Thread 0 does it before the threads start
+// logging together.
+void startEmpty(const benchmark::State& acrState, const std::string& acrPath) {
+  if (acrState.thread_index() == 0) (void)!truncate(acrPath.c_str(), 0);
 }
 
-void BM_Logger_TraceLine(benchmark::State& arState) {
-  files();
+void ours(benchmark::State& arState) {
+  startEmpty(arState, files().mOurs);
   qnbench::setTraceLogging(true);
-  startEmpty(arState);
-  for (auto _ : arState) QN_ENTERED();
-  arState.SetItemsProcessed(arState.iterations());
-}
-BENCHMARK(BM_Logger_TraceLine)->Threads(1)->Threads(2)->UseRealTime();
-
-// The same line as the logger writes, formatted the plain way and written with one write() each:
-// what the logger did before it buffered.
-__attribute__((noinline, format(printf, 6, 7))) void naiveLogLine(int aFd, const char* apTag,
-                                                                  unsigned int aLine, const char* apFunction,
-                                                                  const char* apFile, const char* apFormat,
-                                                                  ...) {
-  char lLine[kQNLogMaxLine];
-  struct timeval lNow;
-  gettimeofday(&lNow, nullptr);
-  struct tm lTm;
-  localtime_r(&lNow.tv_sec, &lTm);
-  int lUsed = snprintf(lLine, sizeof lLine, "%04d-%02d-%02d %02d:%02d:%02d.%06ld %s [%ld] %s (%s:%u) ",
-                       lTm.tm_year + 1900, lTm.tm_mon + 1, lTm.tm_mday, lTm.tm_hour, lTm.tm_min, lTm.tm_sec,
-                       static_cast<long>(lNow.tv_usec), apTag, static_cast<long>(syscall(SYS_gettid)),
-                       apFunction, apFile, aLine);
-  va_list lArgs;
-  va_start(lArgs, apFormat);
-  lUsed += vsnprintf(lLine + lUsed, sizeof lLine - lUsed - 1, apFormat, lArgs);
-  va_end(lArgs);
-  lLine[lUsed++] = '\n';
-  (void)!write(aFd, lLine, static_cast<size_t>(lUsed));
+  for (auto _ : arState) {
+    for (int lLine = 0; lLine < kRoundLines; ++lLine) {
+      // What QN_LOG_TRACE expands to, from a fixed call site so that every contender's line is the same.
+      if (QNIsLogLevelOn(QNLL_Trace))
+        PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", kLine, kFunction, kFile, "%s", "Entered");
+    }
+    flushLogger();
+  }
+  arState.SetItemsProcessed(arState.iterations() * kRoundLines);
 }
 
-void BM_Baseline_WritePerLine(benchmark::State& arState) {
-  const int lFd = files().mBaselineFd;
-  startEmpty(arState);
-  for (auto _ : arState) naiveLogLine(lFd, "-T-", __LINE__, __func__, __FILE__, "%s", "Entered");
-  arState.SetItemsProcessed(arState.iterations());
-}
-BENCHMARK(BM_Baseline_WritePerLine)->Threads(1)->Threads(2)->UseRealTime();
-
-// The argument must never be evaluated when the level is off; if it were, this would cost a call.
-__attribute__((noinline)) const char* expensiveArgument() {
-  static std::string sText(100, 'x');
-  benchmark::DoNotOptimize(sText.data());
-  return sText.c_str();
+void spdlogSync(benchmark::State& arState) {
+  startEmpty(arState, files().mSync);
+  spdlog::logger& lrLogger = *files().mpSync;
+  const spdlog::source_loc lWhere{kFile, static_cast<int>(kLine), kFunction};
+  for (auto _ : arState) {
+    for (int lLine = 0; lLine < kRoundLines; ++lLine)
+      lrLogger.log(lWhere, spdlog::level::trace, "{}", "Entered");
+    lrLogger.flush();
+  }
+  arState.SetItemsProcessed(arState.iterations() * kRoundLines);
 }
 
-void BM_Logger_MaskedOffTrace(benchmark::State& arState) {
+void spdlogAsync(benchmark::State& arState) {
+  startEmpty(arState, files().mAsync);
+  spdlog::async_logger& lrLogger = *files().mpAsync;
+  QNCFlushCounter& lrFlushes = *files().mpAsyncFlushes;
+  const spdlog::source_loc lWhere{kFile, static_cast<int>(kLine), kFunction};
+  for (auto _ : arState) {
+    for (int lLine = 0; lLine < kRoundLines; ++lLine)
+      lrLogger.log(lWhere, spdlog::level::trace, "{}", "Entered");
+    lrFlushes.flushAndWait(lrLogger);  // queued behind this thread's lines
+  }
+  arState.SetItemsProcessed(arState.iterations() * kRoundLines);
+}
+
+BENCHMARK(ours)->Name("Logger/1thread/ours")->Threads(1)->UseRealTime()->MinTime(0.1);
+BENCHMARK(spdlogSync)->Name("Logger/1thread/spdlog_sync")->Threads(1)->UseRealTime()->MinTime(0.1);
+BENCHMARK(spdlogAsync)->Name("Logger/1thread/spdlog_async")->Threads(1)->UseRealTime()->MinTime(0.1);
+BENCHMARK(ours)->Name("Logger/2threads/ours")->Threads(2)->UseRealTime()->MinTime(0.1);
+BENCHMARK(spdlogSync)->Name("Logger/2threads/spdlog_sync")->Threads(2)->UseRealTime()->MinTime(0.1);
+BENCHMARK(spdlogAsync)->Name("Logger/2threads/spdlog_async")->Threads(2)->UseRealTime()->MinTime(0.1);
+
+// The argument is the same for both and cheap; ours must not even evaluate it.
+const char* gspArgument = "an argument";
+
+void oursMaskedOff(benchmark::State& arState) {
   files();
   qnbench::setTraceLogging(false);
-  for (auto _ : arState) QN_LOG_TRACE("%s", expensiveArgument());
+  for (auto _ : arState) {
+    benchmark::DoNotOptimize(gspArgument);
+    QN_LOG_TRACE("%s", gspArgument);
+  }
   qnbench::setTraceLogging(true);
+  arState.SetItemsProcessed(arState.iterations());
 }
-BENCHMARK(BM_Logger_MaskedOffTrace);
+
+void spdlogMaskedOff(benchmark::State& arState) {
+  spdlog::logger& lrLogger = *files().mpSync;
+  lrLogger.set_level(spdlog::level::info);
+  for (auto _ : arState) {
+    benchmark::DoNotOptimize(gspArgument);
+    lrLogger.trace("{}", gspArgument);
+  }
+  lrLogger.set_level(spdlog::level::trace);
+  arState.SetItemsProcessed(arState.iterations());
+}
+
+BENCHMARK(oursMaskedOff)->Name("Logger/maskedoff/ours")->MinTime(0.1);
+BENCHMARK(spdlogMaskedOff)->Name("Logger/maskedoff/spdlog")->MinTime(0.1);
 
 }  // namespace
 

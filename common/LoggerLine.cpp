@@ -21,6 +21,10 @@ struct QNSLineCache {
 
 thread_local QNSLineCache gsLineCache;
 
+// In a shared library each look-up of a thread_local is a call, and the compiler repeats it at
+// every use rather than keep the address: taken once per line through a function that is not inlined.
+__attribute__((noinline)) QNSLineCache& lineCache() { return gsLineCache; }
+
 // A child of fork runs on in the forking thread under a new thread id: forget the cached one.
 void forgetThreadId() { gsLineCache.mTidLength = 0; }
 const int gsForkHook = OsAtFork(nullptr, nullptr, forgetThreadId);
@@ -39,7 +43,17 @@ char* putText(char* apOut, const char* apEnd, const char* apText) {
 }
 
 char* putUnsigned(char* apOut, const char* apEnd, unsigned long aValue, int aMinDigits) {
-  char lDigits[24];
+  int lWidth = 1;
+  for (unsigned long lRest = aValue / 10; lRest != 0; lRest /= 10) ++lWidth;
+  if (lWidth < aMinDigits) lWidth = aMinDigits;
+  if (lWidth <= apEnd - apOut) {
+    // Straight into the line: digits stored bytewise and then read back in wider words would stall
+    // the processor on every line.
+    for (char* lpDigit = apOut + lWidth; lpDigit != apOut; aValue /= 10)
+      *--lpDigit = static_cast<char>('0' + aValue % 10);
+    return apOut + lWidth;
+  }
+  char lDigits[24];  // the line is being cut: its leading digits, as many as fit
   int lCount = 0;
   do {
     lDigits[sizeof lDigits - 1 - lCount++] = static_cast<char>('0' + aValue % 10);
@@ -48,15 +62,14 @@ char* putUnsigned(char* apOut, const char* apEnd, unsigned long aValue, int aMin
   return put(apOut, apEnd, lDigits + sizeof lDigits - lCount, static_cast<size_t>(lCount));
 }
 
-char* putTimeStamp(char* apOut, const char* apEnd) {
+char* putTimeStamp(char* apOut, const char* apEnd, QNSLineCache& arCache) {
   struct timespec lNow;
   clock_gettime(CLOCK_REALTIME, &lNow);
-  QNSLineCache& lrCache = gsLineCache;
-  if (lNow.tv_sec != lrCache.mSecond) {
+  if (lNow.tv_sec != arCache.mSecond) {
     // Time-zone and summer-time changes happen at whole seconds, so one conversion per second is exact.
     struct tm lTm;
     localtime_r(&lNow.tv_sec, &lTm);
-    char* lpText = lrCache.mSecondText;
+    char* lpText = arCache.mSecondText;
     const char* const lpTextEnd = lpText + kSecondText;
     lpText = putUnsigned(lpText, lpTextEnd, static_cast<unsigned long>(lTm.tm_year + 1900), 4);
     lpText = put(lpText, lpTextEnd, "-", 1);
@@ -69,21 +82,20 @@ char* putTimeStamp(char* apOut, const char* apEnd) {
     lpText = putUnsigned(lpText, lpTextEnd, static_cast<unsigned long>(lTm.tm_min), 2);
     lpText = put(lpText, lpTextEnd, ":", 1);
     lpText = putUnsigned(lpText, lpTextEnd, static_cast<unsigned long>(lTm.tm_sec), 2);
-    lrCache.mSecondLength = static_cast<size_t>(lpText - lrCache.mSecondText);
-    lrCache.mSecond = lNow.tv_sec;
+    arCache.mSecondLength = static_cast<size_t>(lpText - arCache.mSecondText);
+    arCache.mSecond = lNow.tv_sec;
   }
-  apOut = put(apOut, apEnd, lrCache.mSecondText, lrCache.mSecondLength);
+  apOut = put(apOut, apEnd, arCache.mSecondText, arCache.mSecondLength);
   apOut = put(apOut, apEnd, ".", 1);
   return putUnsigned(apOut, apEnd, static_cast<unsigned long>(lNow.tv_nsec / 1000), 6);
 }
 
-char* putThreadId(char* apOut, const char* apEnd) {
-  QNSLineCache& lrCache = gsLineCache;
-  if (lrCache.mTidLength == 0) {
-    const int lLength = snprintf(lrCache.mTid, sizeof lrCache.mTid, "[%ld]", OsThreadId());
-    lrCache.mTidLength = static_cast<size_t>(lLength);
+char* putThreadId(char* apOut, const char* apEnd, QNSLineCache& arCache) {
+  if (arCache.mTidLength == 0) {
+    const int lLength = snprintf(arCache.mTid, sizeof arCache.mTid, "[%ld]", OsThreadId());
+    arCache.mTidLength = static_cast<size_t>(lLength);
   }
-  return put(apOut, apEnd, lrCache.mTid, lrCache.mTidLength);
+  return put(apOut, apEnd, arCache.mTid, arCache.mTidLength);
 }
 
 }  // namespace
@@ -92,11 +104,12 @@ size_t QNFormatLogLine(char* apBuffer, size_t aCapacity, const char* apTag, unsi
                        const char* apFunction, const char* apFile, const char* apFormat, va_list aArgs) {
   (void)gsForkHook;
   const char* const lpEnd = apBuffer + aCapacity - 1;  // the last byte is kept for the newline
-  char* lpOut = putTimeStamp(apBuffer, lpEnd);
+  QNSLineCache& lrCache = lineCache();
+  char* lpOut = putTimeStamp(apBuffer, lpEnd, lrCache);
   lpOut = put(lpOut, lpEnd, " ", 1);
   lpOut = putText(lpOut, lpEnd, apTag);
   lpOut = put(lpOut, lpEnd, " ", 1);
-  lpOut = putThreadId(lpOut, lpEnd);
+  lpOut = putThreadId(lpOut, lpEnd, lrCache);
   lpOut = put(lpOut, lpEnd, " ", 1);
   lpOut = putText(lpOut, lpEnd, apFunction);
   lpOut = put(lpOut, lpEnd, " (", 2);

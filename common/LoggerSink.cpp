@@ -60,7 +60,8 @@ void writeToJournal(unsigned int aLevel, const char* apLine, size_t aLength) {
 // Tries the lock for at most about 50 ms; the crash handler must not wait for a lock that the
 // crashing thread itself may hold. try_lock never blocks, and the 1 ms sleeps are clock_nanosleep,
 // which is async-signal-safe.
-bool lockWithin50Ms(std::mutex& arLock) {
+template <typename Lock>
+bool lockWithin50Ms(Lock& arLock) {
   for (int lTry = 0; lTry < 50; ++lTry) {
     if (arLock.try_lock()) return true;
     ClibSleepMS(1);
@@ -82,6 +83,20 @@ void installCrashHandlers() {
 
 }  // namespace
 
+void QNCLogSink::QNCLineLock::lock() {
+  for (unsigned int lTry = 0; !try_lock(); ++lTry) {
+    if (lTry < 100) {
+#if defined(__x86_64__) || defined(__i386__)
+      __builtin_ia32_pause();  // lets the other hyper-thread run and the holder's unlock through
+#endif
+    } else if (lTry < 200) {
+      std::this_thread::yield();
+    } else {
+      ClibSleepMS(1);
+    }
+  }
+}
+
 QNCLogSink& QNCLogSink::instance() {
   // Never destroyed: exit handlers, static destructors of other objects and crash handlers may
   // log or flush after every destructor of this library has run.
@@ -98,7 +113,7 @@ void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) 
   const bool lUrgent = isUrgent(aLevel);
   const bool lJournal = mJournal.load(std::memory_order_relaxed);
   if (lJournal) writeToJournal(aLevel, apLine, aLength);
-  std::unique_lock<std::mutex> lGuard(mLock);
+  std::unique_lock<QNCLineLock> lGuard(mLock);
   if (mState != QNSS_Open) {
     if (mState == QNSS_Memory) mStartup.keep(aLevel, apLine, aLength);
     // Under the lock, so that urgent lines of several threads reach standard error whole. The
@@ -116,7 +131,9 @@ void QNCLogSink::write(unsigned int aLevel, const char* apLine, size_t aLength) 
   memcpy(mpActive + mUsed, apLine, aLength);
   mUsed += aLength;
   const bool lWriteNow = lUrgent || mWriteThrough;
-  const bool lWakeFlusher = lWasEmpty && mFlusherRunning;
+  // An urgent line writes the batch itself; the flusher stays idle, and the next line wakes it.
+  const bool lWakeFlusher = !lWriteNow && lWasEmpty && mFlusherIdle;
+  if (lWakeFlusher) mFlusherIdle = false;
   lGuard.unlock();
   if (lWriteNow) {
     _writeBatch();
@@ -130,7 +147,7 @@ void QNCLogSink::_writeBatch() {
   size_t lLength = 0;
   int lFd = -1;
   {
-    std::lock_guard<std::mutex> lGuard(mLock);
+    std::lock_guard<QNCLineLock> lGuard(mLock);
     char* lpFull = mpActive;
     mpActive = mpSpare;
     mpSpare = lpFull;
@@ -148,7 +165,7 @@ bool QNCLogSink::open(const char* apPath, unsigned int aMask, char* apReason, si
   _writeBatch();  // what belongs to a log already open goes there
   {
     std::lock_guard<std::mutex> lWriteGuard(mWriteLock);
-    std::lock_guard<std::mutex> lGuard(mLock);
+    std::lock_guard<QNCLineLock> lGuard(mLock);
     if (mState == QNSS_Open) {
       writeAll(mFd, mpActive, mUsed);  // lines that came between the write above and the locks
       mUsed = 0;
@@ -185,7 +202,7 @@ bool QNCLogSink::reopen(char* apReason, size_t aReasonSize) {
   if (mState != QNSS_Open) return true;
   const int lFd = OsOpenLogFile(mPath.c_str(), apReason, aReasonSize);
   if (lFd < 0) return false;
-  std::lock_guard<std::mutex> lGuard(mLock);
+  std::lock_guard<QNCLineLock> lGuard(mLock);
   writeAll(mFd, mpActive, mUsed);  // what was logged before the switch ends the old file
   mUsed = 0;
   ClibCloseQuietly(mFd);
@@ -196,7 +213,7 @@ bool QNCLogSink::reopen(char* apReason, size_t aReasonSize) {
 void QNCLogSink::close() {
   bool lJoin = false;
   {
-    std::lock_guard<std::mutex> lGuard(mLock);
+    std::lock_guard<QNCLineLock> lGuard(mLock);
     if (mState != QNSS_Open) return;
     if (mFlusherRunning) {
       mStopFlusher = true;
@@ -208,7 +225,7 @@ void QNCLogSink::close() {
     mFlusher.join();
   }
   std::lock_guard<std::mutex> lWriteGuard(mWriteLock);
-  std::lock_guard<std::mutex> lGuard(mLock);
+  std::lock_guard<QNCLineLock> lGuard(mLock);
   mFlusherRunning = false;
   mStopFlusher = false;
   writeAll(mFd, mpActive, mUsed);
@@ -232,7 +249,7 @@ void QNCLogSink::flushFromCrash() {
 }
 
 void QNCLogSink::_startFlusher() {
-  std::lock_guard<std::mutex> lGuard(mLock);
+  std::lock_guard<QNCLineLock> lGuard(mLock);
   if (mFlusherRunning || mState != QNSS_Open || mWriteThrough) return;
   // Without a flusher, lines still reach the file when a batch fills, at an urgent line and at
   // exit; only the one-second promise is lost, so a failed start is not worth failing a caller.
@@ -245,9 +262,11 @@ void QNCLogSink::_startFlusher() {
 }
 
 void QNCLogSink::_runFlusher() {
-  std::unique_lock<std::mutex> lGuard(mLock);
+  std::unique_lock<QNCLineLock> lGuard(mLock);
   for (;;) {
+    mFlusherIdle = true;
     mFlusherWake.wait(lGuard, [this] { return mStopFlusher || mUsed != 0; });
+    mFlusherIdle = false;
     if (mStopFlusher) return;
     // Let a batch gather, so that a steady trickle of lines costs one write per period.
     mFlusherWake.wait_for(lGuard, kFlushDelay, [this] { return mStopFlusher; });
@@ -264,7 +283,7 @@ void QNCLogSink::_atExit() {
   // The flusher thread is not stopped: exit() may be running on any thread, and the flusher only
   // ever waits for mLock, which no thread holds for longer than one write.
   {
-    std::lock_guard<std::mutex> lGuard(mLock);
+    std::lock_guard<QNCLineLock> lGuard(mLock);
     mWriteThrough = true;
   }
   _writeBatch();
@@ -293,6 +312,7 @@ void QNCLogSink::__forkChild() {
     lrSink.mWriteThrough = true;
   }
   lrSink.mFlusherRunning = false;
+  lrSink.mFlusherIdle = false;
   lrSink.mStopFlusher = false;
   lrSink.mLock.unlock();
   lrSink.mWriteLock.unlock();

@@ -16,7 +16,9 @@
 // copies of concurrent lines never tear there either. While it is off the cost is one relaxed load.
 //
 // Any thread, at any time. write() blocks only for the copy, or for a batch write when the batch is
-// full or the line is urgent.
+// full or the line is urgent. mLock is a spin lock (see QNCLineLock) since the copy it guards
+// takes nanoseconds and a thread put to sleep and woken again would cost both threads far more;
+// the flusher is woken only when it waits for a first line, not for every line.
 
 #include <atomic>
 #include <condition_variable>
@@ -79,7 +81,24 @@ class QNCLogSink {
   char* mpSpare;
   std::string mPath;  // of the open log; written under both locks
 
-  std::mutex mLock;  // guards every member below; mState and mFd are written under both locks
+  // The lock every line is copied under. Held for nanoseconds by writers, so a thread that finds
+  // it taken spins, reading it until it looks free (reads do not pull the cache line away from the
+  // holder); after about a microsecond it yields its processor, and after about a hundred yields
+  // it sleeps a millisecond between tries (open, reopen and close hold it for a file write).
+  class QNCLineLock {
+   public:
+    void lock();
+    bool try_lock() {
+      return !mTaken.load(std::memory_order_relaxed) && !mTaken.exchange(true, std::memory_order_acquire);
+    }
+    void unlock() { mTaken.store(false, std::memory_order_release); }
+
+   private:
+    std::atomic<bool> mTaken{false};
+  };
+
+  // The members every line touches share one cache line with the lock.
+  alignas(64) QNCLineLock mLock;  // guards every member below; mState and mFd are written under both locks
   QNESinkState mState = QNSS_Memory;
   int mFd = -1;
   char* mpActive;
@@ -87,10 +106,11 @@ class QNCLogSink {
   bool mWriteThrough = false;    // after the exit handler, in a child of fork: lines written at once
   bool mFlusherRunning = false;  // a flusher thread exists in this process
   bool mStopFlusher = false;
+  bool mFlusherIdle = false;  // the flusher waits for a first line; only then is it woken
   // Joinable only while mFlusherRunning in the process that started it: a child of fork inherits
   // the object but not the thread, and neither joins nor replaces it (it never starts a flusher).
   std::thread mFlusher;
-  std::condition_variable mFlusherWake;  // a first line in an empty batch, or a stop request
+  std::condition_variable_any mFlusherWake;  // a first line in an empty batch, or a stop request
   QNCLogStartupLines mStartup;
-  char mBatches[2][kBatch];
+  alignas(64) char mBatches[2][kBatch];
 };
