@@ -1,7 +1,7 @@
 // The process as a whole: the single running instance (the PID file, its lock, stopping the
-// running instance) and daemonizing. In-process cases use several managers on one file
-// (open-file-description locks make them conflict like separate processes); process cases start
-// qn_test_helper as real instances and daemons.
+// running instance) and waiting with an eye on the exit flag. In-process cases use several managers on one
+// file (open-file-description locks make them conflict like separate processes); process cases start
+// qn_test_helper as real instances. (Daemonizing: DaemonStartTest, with the real daemon.)
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -12,8 +12,6 @@
 
 #include <chrono>
 #include <functional>
-#include <map>
-#include <sstream>
 #include <thread>
 
 #include "Os.h"
@@ -242,33 +240,6 @@ TEST_F(InstanceTest, KillSignalsNobodyForAShortOrZeroId) {
     EXPECT_EQ(std::string::npos, readFile(lKiller.mLog).find("Attempting to kill"));
     close(lHolder);
   }
-}
-
-TEST(DaemonizeTest, CallerReturnsAtOnceAndTheDaemonIsDetached) {
-  qntest::TempDir lDir;
-  const std::string lReport = lDir.file("report"), lGo = lDir.file("go");
-  const pid_t lCaller = qntest::spawnHelper({"daemon", lReport, lGo}, lDir.file("out"), lDir.file("err"));
-  // The daemon reports only after "go": the caller ending first shows it did not wait for it.
-  ASSERT_EQ(0, qntest::waitExit(lCaller, seconds(10))) << readFile(lDir.file("err"));
-  EXPECT_NE(std::string::npos, readFile(lDir.file("err")).find("Time for parent process to quit"));
-  EXPECT_NE(0, access(lReport.c_str(), F_OK));
-  qntest::writeFile(lGo, "");
-  ASSERT_TRUE(qntest::waitForText(lReport, "done")) << "the daemon never reported";
-  std::map<std::string, std::string> lValues;
-  std::istringstream lIn(readFile(lReport));
-  for (std::string lLine; std::getline(lIn, lLine);)
-    if (lLine.find('=') != std::string::npos)
-      lValues[lLine.substr(0, lLine.find('='))] = lLine.substr(lLine.find('=') + 1);
-  EXPECT_NE(std::to_string(lCaller), lValues["ppid"]);
-  EXPECT_NE(std::to_string(getpid()), lValues["ppid"]);
-  // In a session of its own, but not its leader: it can never regain a controlling terminal.
-  EXPECT_NE(lValues["pid"], lValues["sid"]);
-  EXPECT_NE(std::to_string(getsid(0)), lValues["sid"]);
-  const std::map<std::string, std::string> lExpected = {
-      {"cwd", "/"},         {"umask", "0"},       {"sighup", "ignored"}, {"fd0", "/dev/null"},
-      {"fd1", "/dev/null"}, {"fd2", "/dev/null"}, {"others", ""}};
-  for (const auto& acrEntry : lExpected)
-    EXPECT_EQ(acrEntry.second, lValues[acrEntry.first]) << acrEntry.first;
 }
 
 // A wait of 12 seconds is checked after 5, 10 and 12: a flag set during the first step must end

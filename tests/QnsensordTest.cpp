@@ -1,12 +1,12 @@
 // The example service qnsensord and its client qnsensor-feed as real processes: the command line,
-// the configuration file, daemonizing and stopping with -s, and serving readings end to end.
+// the configuration file, and serving readings end to end until -s stops the service.
+// (A daemon start and its -s stop: DaemonStartTest.)
 
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cstring>
 #include <thread>
 
 #include "LogSupport.h"
@@ -135,43 +135,6 @@ TEST_F(QnsensordTest, ConfigFileSuppliesTheSettingsOrStopsStartUp) {
   EXPECT_NE(std::string::npos, lRun.mLog.find("Using 2 sensor channels"));
   EXPECT_EQ(std::string::npos, lRun.mLog.find(" -T- "))
       << "DebugLevel = 57 holds no trace; -d 255 is not read";
-}
-
-// "-s" with nothing running ends quietly with status 0; without arguments the service becomes a
-// daemon that holds the PID file, and "-s" from another process stops it.
-TEST_F(QnsensordTest, NoArgumentsStartADaemonThatShutdownStops) {
-  const Run lNothing = run({"-s"});
-  EXPECT_EQ(0, lNothing.mStatus);
-  EXPECT_EQ("", lNothing.mStdout);
-  EXPECT_TRUE(hasPidFile()) << "looking for an instance creates the PID file";
-
-  // Waited for, not stopped: the daemon may log that it runs before the starting process leaves.
-  const pid_t lStarter = start("qnsensord", {}, "run");
-  EXPECT_EQ(0, qntest::waitExit(lStarter)) << "the starting process leaves once the daemon exists";
-  ASSERT_TRUE(qntest::waitForText(mLog, "qnsensord running")) << readFile(mLog);
-  EXPECT_NE(std::string::npos,
-            readFile(mLog).find("Running the current process in the background as daemon"));
-  const std::string lPidFile = readFile(mDir.file("qnsensord.pid"));
-  ASSERT_EQ(sizeof(pid_t), lPidFile.size());
-  pid_t lDaemon = 0;
-  std::memcpy(&lDaemon, lPidFile.data(), sizeof lDaemon);
-  EXPECT_NE(lStarter, lDaemon);
-  EXPECT_NE(std::string::npos, readFile(mLog).find("[" + std::to_string(lDaemon) + "] init"));
-
-  const Run lStop = run({"-s"});
-  EXPECT_EQ(0, lStop.mStatus) << lStop.mStderr;
-  EXPECT_EQ("qnsensord shutdown successfully.\n", lStop.mStdout);
-  // A zombie counts as gone: whoever adopted the daemon reaps it.
-  const auto lGone = [&] {
-    const std::string lStat = readFile("/proc/" + std::to_string(lDaemon) + "/stat");
-    return lStat.empty() || lStat.find(") Z") != std::string::npos;
-  };
-  for (int lTry = 0; lTry < 500 && !lGone(); ++lTry)
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-  if (!lGone()) {
-    kill(lDaemon, SIGKILL);
-    ADD_FAILURE() << "the daemon survived -s";
-  }
 }
 
 // Two clients over two channels, four malformed readings among them, and one more client that

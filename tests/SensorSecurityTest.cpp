@@ -1,8 +1,7 @@
-// qnsensord as a local user meets it: the modes of what it creates as a daemon (umask 0), the
+// qnsensord as a local user meets it (the modes of what a daemon creates: DaemonStartTest): the
 // socket paths it refuses to take over, how much a flood of bad readings adds to its log, and a
 // run without root.
 
-#include <dirent.h>
 #include <gtest/gtest.h>
 #include <pwd.h>
 #include <signal.h>
@@ -14,7 +13,6 @@
 #include <algorithm>
 #include <cstdint>
 #include <cstring>
-#include <map>
 #include <string>
 #include <thread>
 #include <vector>
@@ -55,33 +53,6 @@ class SensorSecurityTest : public ::testing::Test {
   std::string mLog = mDir.file("qnsensord.log");
   std::string mSocket = mDir.file("qnsensord.0.sock");
 };
-
-// Started the default way, as a daemon (umask 0), every file and socket gets exactly the mode
-// qnsensord asks for, and none lets others read, write or connect. Ended through its PID file.
-TEST_F(SensorSecurityTest, DaemonCreatesNothingOthersCanUse) {
-  ASSERT_EQ(0, qntest::waitExit(start({"-d", "127"})));  // the starting process leaves at once
-  ASSERT_TRUE(qntest::waitForText(mLog, "qnsensord running")) << qntest::readFile(mLog);
-  std::map<std::string, unsigned int> lCreated;  // name: mode
-  DIR* lpDir = opendir(mDir.path().c_str());
-  for (dirent* lpEntry = readdir(lpDir); lpEntry != nullptr; lpEntry = readdir(lpDir)) {
-    struct stat lStatus;
-    if (lpEntry->d_name[0] == '.' || lstat(mDir.file(lpEntry->d_name).c_str(), &lStatus) != 0) continue;
-    lCreated[lpEntry->d_name] = lStatus.st_mode & 07777;
-  }
-  closedir(lpDir);
-  const std::map<std::string, unsigned int> lExpected = {{"qnsensord.0.sock", 0660},
-                                                         {"qnsensord.1.sock", 0660},
-                                                         {"qnsensord.log", 0640},
-                                                         {"qnsensord.pid", 0640}};
-  EXPECT_EQ(lExpected, lCreated);
-
-  const std::string lPidFile = qntest::readFile(mDir.file("qnsensord.pid"));
-  ASSERT_EQ(4u, lPidFile.size());
-  int32_t lDaemon = 0;
-  memcpy(&lDaemon, lPidFile.data(), 4);
-  ASSERT_EQ(0, kill(lDaemon, SIGTERM));
-  EXPECT_TRUE(qntest::waitForText(mLog, "Destroying the Logger")) << qntest::readFile(mLog);
-}
 
 // 200,000 malformed readings, pipelined over one connection: each is answered, yet the log grows
 // by at most 11 "refused" lines per second begun (10 lines and one count), and the counts account
