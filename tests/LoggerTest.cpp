@@ -6,7 +6,6 @@
 #include <regex>
 #include <sstream>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "LogSupport.h"
@@ -89,40 +88,6 @@ TEST_F(LoggerTest, EveryMessageBecomesOneWellFormedBoundedLine) {
   EXPECT_EQ("first second", messageOf(lLines[4]));
 }
 
-// Every thread writes numbered lines of its own letter, long enough to span many batches; a torn
-// or interleaved line breaks its shape, a lost one leaves a gap in the numbers.
-TEST_F(LoggerTest, LinesOfConcurrentThreadsAreWholeAndNoneIsLost) {
-  constexpr int kThreads = 6;
-  constexpr int kLinesEach = 3000;
-  std::vector<std::thread> lThreads;
-  for (int lThread = 0; lThread < kThreads; ++lThread) {
-    lThreads.emplace_back([lThread] {
-      const std::string lPayload(40 + 30 * lThread, static_cast<char>('a' + lThread));
-      for (int lIndex = 0; lIndex < kLinesEach; ++lIndex) {
-        if (lIndex % 500 == 0) {
-          QN_LOG_WARNING("t%d n%d %s", lThread, lIndex, lPayload.c_str());  // interleaves batch writes
-        } else {
-          QN_LOG_TRACE("t%d n%d %s", lThread, lIndex, lPayload.c_str());
-        }
-      }
-    });
-  }
-  for (auto& lrThread : lThreads) lrThread.join();
-  const std::vector<std::string> lLines = linesOf(log());
-  ASSERT_EQ(static_cast<size_t>(kThreads * kLinesEach), lLines.size());
-  std::vector<int> lNext(kThreads, 0);
-  const std::regex lMessage(R"(t(\d) n(\d+) ([a-z]+))");
-  for (const std::string& lrLine : lLines) {
-    const std::string lText = messageOf(lrLine);
-    std::smatch lParts;
-    ASSERT_TRUE(std::regex_match(lText, lParts, lMessage)) << lrLine;
-    const int lThread = std::stoi(lParts[1].str());
-    ASSERT_LT(lThread, kThreads);
-    EXPECT_EQ(lNext[lThread]++, std::stoi(lParts[2].str())) << "out of order or lost: " << lrLine;
-    EXPECT_EQ(std::string(40 + 30 * lThread, static_cast<char>('a' + lThread)), lParts[3].str());
-  }
-}
-
 // Urgent lines, and whatever flushLogger() finds buffered, are in the file when the call returns.
 TEST_F(LoggerTest, UrgentOrFlushedLineIsInTheFileWhenTheCallReturns) {
   QN_LOG_TRACE("buffered before");
@@ -140,20 +105,6 @@ TEST_F(LoggerTest, UrgentOrFlushedLineIsInTheFileWhenTheCallReturns) {
   for (int lIndex = 0; lIndex < 10; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
   flushLogger();
   EXPECT_EQ(14u, linesOf(qntest::readFile(mLogPath)).size());
-}
-
-TEST_F(LoggerTest, SecondCreateLoggerMovesTheLogAndAppendsToAnExistingFile) {
-  QN_LOG_TRACE("into the first");
-  const std::string lSecond = mDir.file("second.log");
-  qntest::writeFile(lSecond, "existing line\n");
-  CreateLogger(lSecond.c_str());
-  QN_LOG_TRACE("into the second");
-  destroyLogger();
-  EXPECT_EQ(1u, countOf(qntest::readFile(mLogPath), "into the first"));
-  EXPECT_EQ(0u, countOf(qntest::readFile(mLogPath), "into the second"));
-  const std::string lSecondText = qntest::readFile(lSecond);
-  EXPECT_EQ(0u, lSecondText.find("existing line\n"));
-  EXPECT_EQ(1u, countOf(lSecondText, "into the second"));
 }
 
 // Regression: a child forked while lines sat in the buffer wrote them again at its exit, so the
@@ -211,15 +162,6 @@ TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
   EXPECT_EQ(0u, countOf(lStderr, "-T-"));
 }
 
-TEST_F(LoggerProcessTest, DaemonChildInheritsTheLinesKeptBeforeItsFork) {
-  ASSERT_EQ(0, run("daemon", mLog));
-  const std::vector<std::string> lLines = linesOf(qntest::readFile(mLog));
-  ASSERT_EQ(2u, lLines.size());
-  EXPECT_NE(std::string::npos, lLines[0].find(") before fork in "));
-  EXPECT_NE(std::string::npos, lLines[1].find(") child opened the log"));
-  EXPECT_EQ("", stdErr());
-}
-
 // exit(1) from a failed assertion while another thread keeps logging: nothing buffered is lost
 // and the exit does not deadlock against the logging thread.
 TEST_F(LoggerProcessTest, ExitWritesEveryBufferedLine) {
@@ -241,14 +183,6 @@ TEST_F(LoggerProcessTest, CrashSignalWritesTheBufferAndStillKillsTheProcess) {
     EXPECT_EQ(1u, countOf(lText, ") line 99\n"));
     EXPECT_EQ(1u, countOf(lText, "last line before the crash"));
   }
-}
-
-TEST_F(LoggerProcessTest, UnopenablePathIsReportedAndTheProcessGoesOn) {
-  const std::string lBad = mDir.file("no/such/dir/x.log");
-  ASSERT_EQ(0, run("badpath", lBad));
-  EXPECT_NE(std::string::npos, stdErr().find("Cannot open log file '" + lBad + "'")) << stdErr();
-  EXPECT_EQ("went on\n", qntest::readFile(mDir.file("stdout")));
-  EXPECT_EQ(0u, countOf(stdErr(), "still here"));  // an info line never reaches the terminal
 }
 
 }  // namespace
