@@ -3,23 +3,41 @@
 
 #include <gtest/gtest.h>
 
+#include <ostream>
 #include <string>
 
 #include "TestSupport.h"
 
 namespace qntest {
 
-// Matches output that holds exactly one "-H-" line, and that line ends in
+// Matches output that holds exactly one "-H-" line, and that line reads
 // "Assertion [ <condition> ] failed".
-inline ::testing::Matcher<const std::string&> assertionFailure(const std::string& acrCondition) {
-  const std::string lExpected = "Assertion [ " + acrCondition + " ] failed";
-  return ::testing::Truly([lExpected](const std::string& acrOutput) {
+class AssertionOutputMatcher : public ::testing::MatcherInterface<const std::string&> {
+ public:
+  explicit AssertionOutputMatcher(std::string aCondition)
+      : mExpected("Assertion [ " + aCondition + " ] failed") {}
+
+  bool MatchAndExplain(const std::string& acrOutput,
+                       ::testing::MatchResultListener* apListener) const override {
+    const size_t lHaltLines = countOf(acrOutput, "-H-");
     const size_t lAt = acrOutput.find("-H-");
-    const std::string lLine = acrOutput.substr(lAt == std::string::npos ? 0 : lAt);
-    const std::string lHaltLine = lLine.substr(0, lLine.find('\n'));
-    return countOf(acrOutput, "-H-") == 1 && lHaltLine.size() >= lExpected.size() &&
-           lHaltLine.compare(lHaltLine.size() - lExpected.size(), lExpected.size(), lExpected) == 0;
-  });
+    const size_t lEnd = lAt == std::string::npos ? lAt : acrOutput.find('\n', lAt);
+    const std::string lHaltLine = lAt == std::string::npos ? "" : acrOutput.substr(lAt, lEnd - lAt);
+    *apListener << "which holds " << lHaltLines << " \"-H-\" lines";
+    return lHaltLines == 1 && lHaltLine.find(mExpected) != std::string::npos &&
+           lHaltLine.size() >= mExpected.size() &&
+           lHaltLine.compare(lHaltLine.size() - mExpected.size(), mExpected.size(), mExpected) == 0;
+  }
+  void DescribeTo(std::ostream* apStream) const override {
+    *apStream << "holds exactly one \"-H-\" line, ending in \"" << mExpected << "\"";
+  }
+
+ private:
+  std::string mExpected;
+};
+
+inline ::testing::Matcher<const std::string&> assertionFailure(const std::string& acrCondition) {
+  return ::testing::MakeMatcher(new AssertionOutputMatcher(acrCondition));
 }
 
 }  // namespace qntest
