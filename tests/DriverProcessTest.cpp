@@ -99,26 +99,4 @@ TEST_F(DriverProcessTest, TwoInterruptsShutDownOnceAndLaterSignalsAreIgnored) {
   EXPECT_EQ(std::string::npos, lLog.find("Config file parsing not implemented."));
 }
 
-// Any exception but the tolerated one leaves SystemMain at once: later steps do not run and
-// SysExit does not run (it would wait for threads forever here, as nothing asks them to end).
-class DriverFailingStepTest : public DriverProcessTest, public ::testing::WithParamInterface<std::string> {};
-
-TEST_P(DriverFailingStepTest, ExceptionLeavesSystemMainWithoutShutDown) {
-  const std::string& lrStep = GetParam();
-  const pid_t lPid = start({"throw", lrStep});
-  ASSERT_EQ(3, qntest::waitExit(lPid)) << output();
-
-  std::string lExpected;
-  for (const auto& lStep : kStartUpSteps) {
-    lExpected += lStep + "\n";
-    if (lStep == lrStep) break;
-  }
-  lExpected += "SystemMain threw: injected failure in " + lrStep + "\n";
-  EXPECT_EQ(lExpected, output());
-  EXPECT_EQ(std::string::npos, log().find("All threads have gracefully exited"));
-}
-
-INSTANTIATE_TEST_SUITE_P(EveryStartUpStep, DriverFailingStepTest, ::testing::ValuesIn(kStartUpSteps),
-                         [](const ::testing::TestParamInfo<std::string>& acrInfo) { return acrInfo.param; });
-
 }  // namespace

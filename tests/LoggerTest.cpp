@@ -37,29 +37,6 @@ std::string messageOf(const std::string& acrLine) {
 // Each test writes to a log of its own in a fresh directory, closed again at the end.
 class LoggerTest : public qntest::LoggedTest {};
 
-TEST_F(LoggerTest, MaskSelectsTheLevelsWritten) {
-  auto lLogEveryLevel = [](const char* apRound) {
-    QN_LOG_HALT("%s halt", apRound);
-    QN_LOG_ERROR("%s error", apRound);
-    QN_LOG_WARNING("%s warning", apRound);
-    QN_LOG_NOTICE("%s notice", apRound);
-    QN_LOG_INFO("%s info", apRound);
-    QN_LOG_TRACE("%s trace", apRound);
-  };
-  lLogEveryLevel("all");
-  setLogCode(8);
-  lLogEveryLevel("errors");
-  // A direct call is filtered too, not only the macros.
-  PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, __func__, __FILE__, "direct trace");
-  const std::string lLog = log();
-  EXPECT_EQ(7u, linesOf(lLog).size()) << lLog;
-  const std::pair<const char*, const char*> lTagged[] = {
-      {"all halt", "-H-"}, {"all error", "-E-"}, {"all warning", "-W-"}, {"all notice", "-N-"},
-      {"all info", "-I-"}, {"all trace", "-T-"}, {"errors error", "-E-"}};
-  for (const auto& lrTagged : lTagged)
-    EXPECT_EQ(lrTagged.second, qntest::levelOf(lLog, lrTagged.first)) << lLog;
-}
-
 // A line carries time stamp, tag, thread, call site and message, and logging keeps errno. An
 // overlong message is cut to one line of the maximum length, on the "%s" fast path and the
 // formatted one alike; the line breaks of a message become blanks, trailing ones are dropped.

@@ -57,20 +57,14 @@ class InstanceTest : public ::testing::Test {
 
 // Several managers in one process stand for several processes. The second one finds the file
 // naming this very process, where kill(getpid(), SIGTERM) would end the instance that asked.
-TEST_F(InstanceTest, SecondManagerSeesTheInstanceUntilItIsReleasedAndNeverSignalsItself) {
+TEST_F(InstanceTest, SecondManagerNeverSignalsItsOwnProcess) {
   QNCProcessInstanceManager lRunning(mPidFile.c_str());
   lRunning.markAsRunning();
-  EXPECT_EQ(pidBytes(getpid()), readFile(mPidFile));
   QNCProcessInstanceManager lSecond(mPidFile.c_str());
   EXPECT_TRUE(lSecond.isAnInstanceRunning());
   EXPECT_EQ("Failed to terminate running instance (code 488)",
             qntest::thrown<QNCTerminateFailedEx>([&] { lSecond.killRunningInstance(); }, true));
-  EXPECT_TRUE(lockedByOther(mPidFile));
   lRunning.exitCleanup();
-  EXPECT_FALSE(lockedByOther(mPidFile));
-  QNCProcessInstanceManager lThird(mPidFile.c_str());
-  EXPECT_FALSE(lThird.isAnInstanceRunning());
-  lThird.killRunningInstance();  // "No instance running... cannot kill": returns quietly
   EXPECT_FALSE(lockedByOther(mPidFile));
 }
 
@@ -105,36 +99,11 @@ TEST_F(InstanceTest, StartInTheReopeningGapNeverLeavesTheFileNamingTheWrongProce
   });
   // The refusal names the descriptor and the file.
   const std::string lRefusal = qntest::thrown<QNCFileLockFailedEx>([&] { lLoser.markAsRunning(); }, true);
-  EXPECT_NE(std::string::npos,
-            lRefusal.find("' (locked by another process): Resource temporarily unavailable (code 11)"))
-      << lRefusal;
   EXPECT_EQ(0u, lRefusal.find("fcntl(F_OFD_SETLK) fd ")) << lRefusal;
-  EXPECT_NE(std::string::npos, lRefusal.find(" '" + mPidFile + "'")) << lRefusal;
+  EXPECT_NE(std::string::npos, lRefusal.find(" '" + mPidFile + "' (locked by another process): "))
+      << lRefusal;
   EXPECT_EQ(lIntruderId, readFile(mPidFile));
   close(lIntruderFd);
-}
-
-int openDescriptorCount() {
-  int lCount = 0;
-  for (int lFd = 0; lFd < 1024; ++lFd) lCount += fcntl(lFd, F_GETFD) != -1 ? 1 : 0;
-  return lCount;
-}
-
-TEST_F(InstanceTest, ProcStatusReadsTheIdAndNoFailureLeavesADescriptorOpen) {
-  const int lDescriptors = openDescriptorCount();
-  {
-    QNCProcessInstanceManager lManager(mDir.file("no/such/dir.pid").c_str());
-    EXPECT_THROW(lManager.markAsRunning(), QNCOpenFailedEx);
-    EXPECT_THROW(lManager.isAnInstanceRunning(), QNCOpenFailedEx);
-    lManager.exitCleanup();  // nothing held: no effect
-    qntest::writeFile(mPidFile, pidBytes(getpid()) + "tail");
-    EXPECT_NO_THROW(lManager.getProcStatusFromPidFile(mPidFile.c_str()));
-    // Two bytes of our own id would read as a small, possibly living pid: a short file names none.
-    qntest::writeFile(mPidFile, pidBytes(getpid()).substr(0, 2));
-    EXPECT_THROW(lManager.getProcStatusFromPidFile(mPidFile.c_str()), QNCClibGetProcStatusFailedEx);
-    EXPECT_THROW(lManager.getProcStatusFromPidFile(mDir.file("missing.pid").c_str()), QNCOpenFailedEx);
-  }
-  EXPECT_EQ(lDescriptors, openDescriptorCount());
 }
 
 // The first instance asks getProcStatus() about its own PID file, which opens and closes it: were

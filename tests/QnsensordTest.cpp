@@ -398,6 +398,7 @@ TEST_F(SensorSecurityTest, RefusesASquattedSocketPathAndReplacesItsOwnStaleSocke
     EXPECT_EQ(1, qntest::waitExit(spawnIn({"-D", "false", "-n", "1"}, "run")));
     EXPECT_NE(std::string::npos, readFile(mDir.file("run.err")).find("exists and is not a socket"))
         << readFile(mDir.file("run.err"));
+    EXPECT_EQ(std::string::npos, readFile(mLog).find("All threads have gracefully exited"));
     struct stat lStatus;
     ASSERT_EQ(0, lstat(channel(0).c_str(), &lStatus));
     EXPECT_EQ(lDirectory, S_ISDIR(lStatus.st_mode));

@@ -7,11 +7,10 @@
 //   kill <pid-file> <log>             stop the running instance recorded in the file
 //   log-startup|log-exit <log>, log-crash <log> <signal>
 //                                     one logger scenario that needs a process of its own
-//   run|linger [<requests>], throw <step>
+//   run|linger [<requests>]
 //                                     a service on the start-up and shut-down driver (see Driver)
 //
-// A QNCException is printed to standard error as "error: <message> (code <n>)", exit status 1;
-// SystemMain throwing gives status 3.
+// A QNCException is printed to standard error as "error: <message> (code <n>)", exit status 1.
 
 #include <signal.h>
 #include <sys/mman.h>
@@ -125,15 +124,12 @@ int logger(const std::string& acrMode, int argc, char** argv) {
 // without calling the base, so the tests see the driver's sequence alone. Each logs "step <name>"
 // ($QN_LOG_DIR/driver_app.log) and prints "<name>" at once. "run": parseConfigFile throws
 // QNCNotImplementedEx as a service without a configuration file does; "linger": it succeeds and
-// the process lives a second past SystemMain; "throw <step>": that step throws QNCExistsEx.
+// the process lives a second past SystemMain.
 // waitForThreads blocks until makeThreadsToExit has been called <requests> times.
 class Driver : public qntest::TableSystem {
  public:
-  Driver(std::string aMode, std::string aFailingStep, unsigned int aRequests)
-      : TableSystem(0, 0, 0),
-        mMode(std::move(aMode)),
-        mFailingStep(std::move(aFailingStep)),
-        mExpected(aRequests) {}
+  Driver(std::string aMode, unsigned int aRequests)
+      : TableSystem(0, 0, 0), mMode(std::move(aMode)), mExpected(aRequests) {}
   ~Driver() override { step("destructor"); }
 
   void preInit() override { step("preInit"); }
@@ -178,10 +174,9 @@ class Driver : public qntest::TableSystem {
   void step(const char* apName) {
     QN_LOG_NOTICE("step %s", apName);
     say(apName);
-    if (mFailingStep == apName) throw QNCExistsEx((std::string("injected failure in ") + apName).c_str(), 10);
   }
 
-  const std::string mMode, mFailingStep;
+  const std::string mMode;
   const unsigned int mExpected;
   std::mutex mLock;  // guards mRequests
   std::condition_variable mChanged;
@@ -189,16 +184,9 @@ class Driver : public qntest::TableSystem {
 };
 
 int driver(const std::string& acrMode, int argc, char** argv) {
-  const bool lThrow = acrMode == "throw";
-  const unsigned int lRequests = !lThrow && argc > 2 ? static_cast<unsigned int>(atoi(argv[2])) : 1;
-  try {
-    setSystemObject(new Driver(acrMode, lThrow && argc > 2 ? argv[2] : "", lRequests));
-    setLogFilePath("driver_app.log");
-    SystemMain(argc, argv);
-  } catch (const QNCException& acrException) {
-    say(std::string("SystemMain threw: ") + acrException.what());
-    return 3;
-  }
+  setSystemObject(new Driver(acrMode, argc > 2 ? static_cast<unsigned int>(atoi(argv[2])) : 1));
+  setLogFilePath("driver_app.log");
+  SystemMain(argc, argv);
   say("SystemMain returned");
   if (acrMode == "linger") {
     // The tests send signals now; with their default effect any of them would end the process.
@@ -216,7 +204,7 @@ int main(int argc, char** argv) {
     if ((lMode == "hold" || lMode == "hold-stubborn" || lMode == "kill") && argc > 3)
       return instance(lMode, argc, argv);
     if (lMode.compare(0, 4, "log-") == 0 && argc > 2) return logger(lMode, argc, argv);
-    if (lMode == "run" || lMode == "linger" || lMode == "throw") return driver(lMode, argc, argv);
+    if (lMode == "run" || lMode == "linger") return driver(lMode, argc, argv);
   } catch (const QNCException& acrException) {
     fprintf(stderr, "error: %s (code %u)\n", acrException.what(), acrException.getCode());
     return 1;
