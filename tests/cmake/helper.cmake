@@ -3,7 +3,7 @@
 add_executable(qn_test_helper ${CMAKE_CURRENT_SOURCE_DIR}/programs/TestHelper.cpp)
 target_link_libraries(qn_test_helper PRIVATE QNSystem::QNSystem)
 target_include_directories(qn_test_helper PRIVATE ${CMAKE_CURRENT_SOURCE_DIR}/support)
-foreach(lTest ProcessTest DriverProcessTest LoggerTest)
+foreach(lTest ProcessTest LoggerTest)
   if(TARGET ${lTest})
     add_dependencies(${lTest} qn_test_helper)
   endif()
