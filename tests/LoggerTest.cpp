@@ -1,12 +1,23 @@
+// The logger: the shape and bound of its lines, its buffer across fork, exit and crashes (in
+// processes of their own, qn_test_helper's log- modes), and where its lines go besides the file:
+// the journal copy on standard error, reopening after the log was moved away (SIGUSR1), safe
+// opening and the mode of a new log file.
+
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
+#include <csignal>
+#include <cstdio>
 #include <regex>
 #include <sstream>
 #include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
 #include "LogSupport.h"
@@ -38,29 +49,6 @@ std::string messageOf(const std::string& acrLine) {
 // Each test writes to a log of its own in a fresh directory, closed again at the end.
 class LoggerTest : public qntest::LoggedTest {};
 
-TEST_F(LoggerTest, MaskSelectsTheLevelsWritten) {
-  auto lLogEveryLevel = [](const char* apRound) {
-    QN_LOG_HALT("%s halt", apRound);
-    QN_LOG_ERROR("%s error", apRound);
-    QN_LOG_WARNING("%s warning", apRound);
-    QN_LOG_NOTICE("%s notice", apRound);
-    QN_LOG_INFO("%s info", apRound);
-    QN_LOG_TRACE("%s trace", apRound);
-  };
-  lLogEveryLevel("all");
-  setLogCode(8);
-  lLogEveryLevel("errors");
-  // A direct call is filtered too, not only the macros.
-  PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, __func__, __FILE__, "direct trace");
-  const std::string lLog = log();
-  EXPECT_EQ(7u, linesOf(lLog).size()) << lLog;
-  const std::pair<const char*, const char*> lTagged[] = {
-      {"all halt", "-H-"}, {"all error", "-E-"}, {"all warning", "-W-"}, {"all notice", "-N-"},
-      {"all info", "-I-"}, {"all trace", "-T-"}, {"errors error", "-E-"}};
-  for (const auto& lrTagged : lTagged)
-    EXPECT_EQ(lrTagged.second, qntest::levelOf(lLog, lrTagged.first)) << lLog;
-}
-
 // A line carries time stamp, tag, thread, call site and message, and logging keeps errno. An
 // overlong message is cut to one line of the maximum length, on the "%s" fast path and the
 // formatted one alike; the line breaks of a message become blanks, trailing ones are dropped.
@@ -89,40 +77,6 @@ TEST_F(LoggerTest, EveryMessageBecomesOneWellFormedBoundedLine) {
   EXPECT_EQ("first second", messageOf(lLines[4]));
 }
 
-// Every thread writes numbered lines of its own letter, long enough to span many batches; a torn
-// or interleaved line breaks its shape, a lost one leaves a gap in the numbers.
-TEST_F(LoggerTest, LinesOfConcurrentThreadsAreWholeAndNoneIsLost) {
-  constexpr int kThreads = 6;
-  constexpr int kLinesEach = 3000;
-  std::vector<std::thread> lThreads;
-  for (int lThread = 0; lThread < kThreads; ++lThread) {
-    lThreads.emplace_back([lThread] {
-      const std::string lPayload(40 + 30 * lThread, static_cast<char>('a' + lThread));
-      for (int lIndex = 0; lIndex < kLinesEach; ++lIndex) {
-        if (lIndex % 500 == 0) {
-          QN_LOG_WARNING("t%d n%d %s", lThread, lIndex, lPayload.c_str());  // interleaves batch writes
-        } else {
-          QN_LOG_TRACE("t%d n%d %s", lThread, lIndex, lPayload.c_str());
-        }
-      }
-    });
-  }
-  for (auto& lrThread : lThreads) lrThread.join();
-  const std::vector<std::string> lLines = linesOf(log());
-  ASSERT_EQ(static_cast<size_t>(kThreads * kLinesEach), lLines.size());
-  std::vector<int> lNext(kThreads, 0);
-  const std::regex lMessage(R"(t(\d) n(\d+) ([a-z]+))");
-  for (const std::string& lrLine : lLines) {
-    const std::string lText = messageOf(lrLine);
-    std::smatch lParts;
-    ASSERT_TRUE(std::regex_match(lText, lParts, lMessage)) << lrLine;
-    const int lThread = std::stoi(lParts[1].str());
-    ASSERT_LT(lThread, kThreads);
-    EXPECT_EQ(lNext[lThread]++, std::stoi(lParts[2].str())) << "out of order or lost: " << lrLine;
-    EXPECT_EQ(std::string(40 + 30 * lThread, static_cast<char>('a' + lThread)), lParts[3].str());
-  }
-}
-
 // Urgent lines, and whatever flushLogger() finds buffered, are in the file when the call returns.
 TEST_F(LoggerTest, UrgentOrFlushedLineIsInTheFileWhenTheCallReturns) {
   QN_LOG_TRACE("buffered before");
@@ -140,20 +94,6 @@ TEST_F(LoggerTest, UrgentOrFlushedLineIsInTheFileWhenTheCallReturns) {
   for (int lIndex = 0; lIndex < 10; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
   flushLogger();
   EXPECT_EQ(14u, linesOf(qntest::readFile(mLogPath)).size());
-}
-
-TEST_F(LoggerTest, SecondCreateLoggerMovesTheLogAndAppendsToAnExistingFile) {
-  QN_LOG_TRACE("into the first");
-  const std::string lSecond = mDir.file("second.log");
-  qntest::writeFile(lSecond, "existing line\n");
-  CreateLogger(lSecond.c_str());
-  QN_LOG_TRACE("into the second");
-  destroyLogger();
-  EXPECT_EQ(1u, countOf(qntest::readFile(mLogPath), "into the first"));
-  EXPECT_EQ(0u, countOf(qntest::readFile(mLogPath), "into the second"));
-  const std::string lSecondText = qntest::readFile(lSecond);
-  EXPECT_EQ(0u, lSecondText.find("existing line\n"));
-  EXPECT_EQ(1u, countOf(lSecondText, "into the second"));
 }
 
 // Regression: a child forked while lines sat in the buffer wrote them again at its exit, so the
@@ -211,23 +151,14 @@ TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
   EXPECT_EQ(0u, countOf(lStderr, "-T-"));
 }
 
-TEST_F(LoggerProcessTest, DaemonChildInheritsTheLinesKeptBeforeItsFork) {
-  ASSERT_EQ(0, run("daemon", mLog));
-  const std::vector<std::string> lLines = linesOf(qntest::readFile(mLog));
-  ASSERT_EQ(2u, lLines.size());
-  EXPECT_NE(std::string::npos, lLines[0].find(") before fork in "));
-  EXPECT_NE(std::string::npos, lLines[1].find(") child opened the log"));
-  EXPECT_EQ("", stdErr());
-}
-
-// exit(1) from a failed assertion while another thread keeps logging: nothing buffered is lost
-// and the exit does not deadlock against the logging thread.
+// exit(1) right after 1000 lines while another thread keeps logging: the exit handler writes
+// every buffered line and does not deadlock against the logging thread. (An assertion's exit
+// writes its urgent "-H-" line, and the buffer with it, before that: the death tests.)
 TEST_F(LoggerProcessTest, ExitWritesEveryBufferedLine) {
   ASSERT_EQ(1, run("exit", mLog));
   const std::string lLog = qntest::readFile(mLog);
   for (int lIndex = 0; lIndex < 1000; ++lIndex)
     ASSERT_EQ(1u, countOf(lLog, ") line " + std::to_string(lIndex) + "\n")) << "line " << lIndex;
-  EXPECT_EQ(1u, countOf(lLog, "Assertion [ lStarted.load() == false ] failed\n"));
   for (const std::string& lrLine : linesOf(lLog)) ASSERT_TRUE(std::regex_match(lrLine, kLine)) << lrLine;
 }
 
@@ -243,12 +174,135 @@ TEST_F(LoggerProcessTest, CrashSignalWritesTheBufferAndStillKillsTheProcess) {
   }
 }
 
-TEST_F(LoggerProcessTest, UnopenablePathIsReportedAndTheProcessGoesOn) {
-  const std::string lBad = mDir.file("no/such/dir/x.log");
-  ASSERT_EQ(0, run("badpath", lBad));
-  EXPECT_NE(std::string::npos, stdErr().find("Cannot open log file '" + lBad + "'")) << stdErr();
-  EXPECT_EQ("went on\n", qntest::readFile(mDir.file("stdout")));
-  EXPECT_EQ(0u, countOf(stdErr(), "still here"));  // an info line never reaches the terminal
+// Standard error goes to a file for the object's life.
+struct StderrToFile {
+  explicit StderrToFile(const std::string& acrPath) : mSaved(dup(2)) {
+    const int lFd = open(acrPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+    dup2(lFd, 2);
+    close(lFd);
+  }
+  ~StderrToFile() {
+    dup2(mSaved, 2);
+    close(mSaved);
+  }
+  const int mSaved;
+};
+
+class LogOutputTest : public qntest::LoggedTest {
+ protected:
+  std::string mErr = mDir.file("stderr");
+};
+
+// The copy is made for QN_LOG_STDERR=1 and for a JOURNAL_STREAM that names standard error itself,
+// not for one naming another stream (standard error redirected after systemd started the process).
+// It is each line of the log behind its priority, one per line. Each case's new log file is made
+// 0640 under a different umask (a daemon's is 0).
+TEST_F(LogOutputTest, JournalCopyCarriesEachLinesPriority) {
+  const std::tuple<unsigned int, const char*, const char*> lLevels[] = {
+      {QNLL_Halt, "-H-", "<2>"},   {QNLL_Error, "-E-", "<3>"}, {QNLL_Warning, "-W-", "<4>"},
+      {QNLL_Notice, "-N-", "<5>"}, {QNLL_Info, "-I-", "<6>"},  {QNLL_Trace, "-T-", "<7>"}};
+  const std::tuple<std::string, const char*, bool, bool, mode_t> lCases[] = {
+      {"forced", "1", false, true, 0},
+      {"journal", nullptr, true, true, 022},
+      {"other", "0", false, false, 077}};
+  for (const auto& [lCase, lpForced, lStreamIsStderr, lCopied, lUmask] : lCases) {
+    const std::string lLogPath = mDir.file(lCase + ".log");
+    const mode_t lPrevious = umask(lUmask);
+    struct stat lStat;
+    {
+      StderrToFile lRedirect(mErr);
+      ASSERT_EQ(0, fstat(2, &lStat));
+      const std::string lOwn = std::to_string(lStat.st_dev) + ":" + std::to_string(lStat.st_ino);
+      setenv("JOURNAL_STREAM", lStreamIsStderr ? lOwn.c_str() : "1:1", 1);
+      lpForced != nullptr ? setenv("QN_LOG_STDERR", lpForced, 1) : unsetenv("QN_LOG_STDERR");
+      CreateLogger(QNCString(lLogPath.c_str()));
+      for (const auto& [lLevel, lpTag, lpPrefix] : lLevels)
+        PrintLogMessageWithTimeStamp(lLevel, lpTag, 1, "f", "x.cpp", "%s", lpPrefix);
+      destroyLogger();
+    }
+    umask(lPrevious);
+    unsetenv("JOURNAL_STREAM");
+    unsetenv("QN_LOG_STDERR");
+    ASSERT_EQ(0, stat(lLogPath.c_str(), &lStat));
+    EXPECT_EQ(0640u, lStat.st_mode & 07777) << "a new log's mode under umask " << lUmask;
+    const std::string lLog = qntest::readFile(lLogPath);
+    std::string lExpected;
+    size_t lAt = 0;
+    for (const auto& [lLevel, lpTag, lpPrefix] : lLevels) {
+      const size_t lEnd = lLog.find('\n', lAt) + 1;
+      EXPECT_EQ(lpTag, qntest::levelOf(lLog, lpPrefix)) << lLog;
+      lExpected += lpPrefix + lLog.substr(lAt, lEnd - lAt);
+      lAt = lEnd;
+    }
+    EXPECT_EQ(lCopied ? lExpected : "", qntest::readFile(mErr)) << lCase;
+  }
+}
+
+// logrotate moves the log away and sends SIGUSR1 while four threads log: every line is found
+// exactly once in the two files together, whole, and lines logged after the reopen are in the
+// new file. Urgent lines among them write through during the switch.
+TEST_F(LogOutputTest, Sigusr1ReopensTheMovedLogLosingAndTearingNothing) {
+  constexpr int kThreads = 4;
+  std::atomic<bool> lStop{false};
+  std::atomic<int> lCounts[kThreads] = {};
+  std::vector<std::thread> lWriters;
+  for (int lThread = 0; lThread < kThreads; ++lThread)
+    lWriters.emplace_back([&, lThread] {
+      for (int lLine = 0; !lStop.load() || lLine < 2000; ++lLine, lCounts[lThread].store(lLine)) {
+        const bool lUrgent = lLine % 97 == 0;
+        PrintLogMessageWithTimeStamp(lUrgent ? QNLL_Warning : QNLL_Info, lUrgent ? "-W-" : "-I-", 1, "f",
+                                     "x.cpp", "line %d.%d", lThread, lLine);
+        if (lLine % 50 == 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));  // bounds the files
+      }
+    });
+  while (lCounts[0].load() < 500) std::this_thread::yield();
+  const std::string lMoved = mDir.file("test.log.1");
+  ASSERT_EQ(0, rename(mLogPath.c_str(), lMoved.c_str()));
+  ASSERT_EQ(0, kill(getpid(), SIGUSR1));
+  EXPECT_TRUE(qntest::waitForText(mLogPath, "line ", std::chrono::seconds(10)));
+  lStop.store(true);
+  for (std::thread& lrWriter : lWriters) lrWriter.join();
+  const std::string lAll = qntest::readFile(lMoved) + log();
+  std::vector<int> lSeen[kThreads];
+  for (int lThread = 0; lThread < kThreads; ++lThread) lSeen[lThread].assign(lCounts[lThread].load(), 0);
+  for (size_t lAt = 0, lEnd; (lEnd = lAll.find('\n', lAt)) != std::string::npos; lAt = lEnd + 1) {
+    const std::string lText = lAll.substr(lAt, lEnd - lAt);
+    int lThread = -1, lLine = -1, lTail = 0;
+    const size_t lMessage = lText.find(" (x.cpp:1) line ");
+    ASSERT_TRUE(lText.rfind("20", 0) == 0 && lMessage != std::string::npos &&
+                sscanf(lText.c_str() + lMessage, " (x.cpp:1) line %d.%d%n", &lThread, &lLine, &lTail) == 2 &&
+                lText.size() == lMessage + lTail)
+        << "torn: " << lText;
+    ++lSeen[lThread].at(lLine);
+  }
+  for (const std::vector<int>& lrSeen : lSeen) EXPECT_EQ(lrSeen, std::vector<int>(lrSeen.size(), 1));
+}
+
+// A link planted at the log's path, a FIFO, a file of another user: none is opened (the FIFO
+// without waiting for a reader), each is named with its reason on standard error, the target
+// keeps its contents, and the log already open goes on.
+TEST_F(LogOutputTest, UnsafeLogPathsAreRefusedAndTheOpenLogGoesOn) {
+  const std::string lTarget = mDir.file("precious"), lForeign = mDir.file("foreign"),
+                    lFifo = mDir.file("fifo");
+  for (const std::string& lrFile : {lTarget, lForeign}) qntest::writeFile(lrFile, "keep\n");
+  ASSERT_EQ(0, symlink(lTarget.c_str(), mDir.file("link").c_str()));
+  ASSERT_EQ(0, mkfifo(lFifo.c_str(), 0600));
+  const bool lRoot = geteuid() == 0 && chown(lForeign.c_str(), 1, 1) == 0;
+  const std::pair<std::string, std::string> lCases[] = {
+      {mDir.file("link"), "is a symbolic link (not followed)"},
+      {lFifo, "is not a regular file"},
+      {lForeign, "is owned by another user (uid 1)"}};
+  for (const auto& lrCase : lCases) {
+    if (lrCase.first == lForeign && !lRoot) continue;  // only root can give a file away
+    {
+      StderrToFile lRedirect(mErr);
+      CreateLogger(QNCString(lrCase.first.c_str()));
+      QN_LOG_ERROR("after %s", lrCase.second.c_str());
+    }
+    EXPECT_EQ("Cannot open log file '" + lrCase.first + "': " + lrCase.second + "\n", qntest::readFile(mErr));
+    EXPECT_NE(std::string::npos, log().find("after " + lrCase.second));
+  }
+  for (const std::string& lrFile : {lTarget, lForeign}) EXPECT_EQ("keep\n", qntest::readFile(lrFile));
 }
 
 }  // namespace

@@ -1,15 +1,10 @@
 // The operating-system layer and the C library wrappers: error reports, calls interrupted by
-// signals, processes, the host, and the primitives under the conditionals and mutexes.
+// signals, and the primitives under the conditionals and mutexes.
 
-#include <arpa/inet.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <net/if.h>
 #include <pthread.h>
 #include <signal.h>
-#include <sys/ioctl.h>
-#include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -18,12 +13,10 @@
 #include <chrono>
 #include <cstring>
 #include <functional>
-#include <set>
 #include <string>
 #include <thread>
 
 #include "Clib.h"
-#include "Conditional.h"
 #include "Mutex.h"
 #include "Os.h"
 #include "QNException.h"
@@ -95,9 +88,6 @@ TEST_F(ClibTest, FailuresNameTheCallTheObjectAndTheSystemText) {
   const std::string lMissing = mDir.file("missing/x.pid");
   EXPECT_EQ("open '" + lMissing + "': No such file or directory (code " + std::to_string(ENOENT) + ")",
             qntest::thrown<QNCOpenFailedEx>([&] { ClibOpen(lMissing.c_str(), O_RDONLY, 0); }, true));
-  struct stat lStat;
-  EXPECT_EQ("stat '" + lMissing + "': No such file or directory",
-            qntest::thrown<QNCClibStatFailedEx>([&] { ClibStat(lMissing.c_str(), &lStat); }));
 
   const std::string lFile = mDir.file("log");
   const int lWriteOnly = ClibOpen(lFile.c_str(), O_WRONLY | O_CREAT, 0600);
@@ -105,9 +95,6 @@ TEST_F(ClibTest, FailuresNameTheCallTheObjectAndTheSystemText) {
   EXPECT_EQ("read fd " + std::to_string(lWriteOnly) + " '" + lFile + "': Bad file descriptor",
             qntest::thrown<QNCReadFailedEx>([&] { ClibRead(lWriteOnly, &lByte, 1); }));
   ClibClose(lWriteOnly);
-  EXPECT_EQ("close fd " + std::to_string(lWriteOnly) + ": Bad file descriptor",
-            qntest::thrown<QNCCloseFailedEx>([&] { ClibClose(lWriteOnly); }));
-  EXPECT_THROW(ClibChdir(lMissing.c_str()), QNCOpenFailedEx);
 
   // A pipe nobody reads, with SIGPIPE ignored as a service does: the write fails with EPIPE
   // instead of looping or reporting success.
@@ -121,7 +108,7 @@ TEST_F(ClibTest, FailuresNameTheCallTheObjectAndTheSystemText) {
 
 // A handler without SA_RESTART makes a blocked call return EINTR; the raw read shows that the
 // set-up does interrupt it. The wrappers must go on: the read returns the data, the write that
-// was cut short writes the rest from where it stopped, the sleep lasts its whole time.
+// was cut short writes the rest from where it stopped.
 TEST_F(ClibTest, SignalsDuringBlockedCallsNeverSurface) {
   InterruptingSignal lSignal;
   char lByte = 0;
@@ -151,59 +138,6 @@ TEST_F(ClibTest, SignalsDuringBlockedCallsNeverSurface) {
       }));
   EXPECT_EQ(lSent.size(), lWritten);
   EXPECT_TRUE(lSent == lReceived) << "received " << lReceived.size() << " bytes, not the ones sent";
-
-  const auto lStart = std::chrono::steady_clock::now();
-  ASSERT_TRUE(lSignal.interrupt([] { ClibSleepMS(400); }, [] {}));
-  const auto lSlept = std::chrono::steady_clock::now() - lStart;
-  EXPECT_GE(lSlept, milliseconds(400));
-  EXPECT_LT(lSlept, milliseconds(400 + 5000));
-}
-
-// Signal 0 to 0 or -1 would succeed for a process group or everyone: refusal proves no call.
-TEST_F(ClibTest, ProcStatusTellsExistingFromGoneAndRefusesGroups) {
-  EXPECT_EQ(0, ClibGetProcStatus(ClibGetpid()));
-  EXPECT_EQ(0, ClibGetProcStatus(1));  // exists always; may belong to another user (EPERM)
-  const pid_t lChild = fork();
-  if (lChild == 0) _exit(0);
-  ASSERT_EQ(0, qntest::waitExit(lChild));  // reaped: the pid names no process now
-  EXPECT_EQ("kill(signal 0) pid " + std::to_string(lChild) + ": No such process (code " +
-                std::to_string(ESRCH) + ")",
-            qntest::thrown<QNCClibGetProcStatusFailedEx>([&] { ClibGetProcStatus(lChild); }, true));
-  for (int lPid : {0, -1, -12345}) {
-    EXPECT_NE(std::string::npos,
-              qntest::thrown<QNCClibGetProcStatusFailedEx>([&] { ClibGetProcStatus(lPid); }, true)
-                  .find("(code " + std::to_string(EINVAL) + ")"))
-        << lPid;
-    errno = 0;
-    EXPECT_GT(0, OsKill(lPid, 0)) << lPid;
-    EXPECT_EQ(EINVAL, errno);
-  }
-}
-
-// The address is one of this host's up, non-loopback interfaces as the older SIOCGIFCONF lists
-// them (loopback when there is none), in host byte order: a swapped one is no address of this host.
-TEST(OsHostTest, IpAddressIsOneOfThisHostsInHostByteOrder) {
-  std::set<unsigned int> lCandidates;
-  const int lSocket = socket(AF_INET, SOCK_DGRAM, 0);
-  struct ifreq lRequests[64];
-  struct ifconf lConfig = {};
-  lConfig.ifc_len = sizeof lRequests;
-  lConfig.ifc_req = lRequests;
-  ASSERT_EQ(0, ioctl(lSocket, SIOCGIFCONF, &lConfig));
-  for (size_t lIndex = 0; lIndex < lConfig.ifc_len / sizeof(struct ifreq); ++lIndex) {
-    struct ifreq lFlags = lRequests[lIndex];
-    if (ioctl(lSocket, SIOCGIFFLAGS, &lFlags) != 0 || (lFlags.ifr_flags & IFF_UP) == 0 ||
-        (lFlags.ifr_flags & IFF_LOOPBACK) != 0)
-      continue;
-    sockaddr_in lAddress;
-    memcpy(&lAddress, &lRequests[lIndex].ifr_addr, sizeof lAddress);
-    lCandidates.insert(ntohl(lAddress.sin_addr.s_addr));
-  }
-  close(lSocket);
-  unsigned int lAddress = 0;
-  OsGetIpAddress(lAddress);
-  EXPECT_TRUE(lCandidates.empty() ? lAddress == 0x7F000001u : lCandidates.count(lAddress) == 1)
-      << std::hex << lAddress;
 }
 
 // The deadline is computed on the monotonic clock; a condition variable left on the wall clock
@@ -231,52 +165,15 @@ TEST(ConditionalTest, TimedWaitNobodySignalsThrowsAfterTheTimeWithTheMutexHeld) 
   OsDestroyMutex(lMutex);
 }
 
-// Ping-pong between two threads: every hand-over needs one wake-up. Ping waits with wait(), pong
-// with timedWait(); a wake-up lost to pong ends in a time-out, one lost to ping in a hang that
-// the test's time limit ends.
-TEST(ConditionalTest, SignalWakesTheWaiterForEveryHandOver) {
-  QNCConditional lConditional;
-  int lTurn = 0;  // guarded by lConditional's mutex; even: ping's turn, odd: pong's
-  auto lPlayer = [&](int aParity) {
-    for (int lRound = 0; lRound < 2000; ++lRound) {
-      lConditional.lock();
-      try {
-        while (lTurn % 2 != aParity) aParity == 0 ? lConditional.wait() : lConditional.timedWait(10000);
-      } catch (QNCTimeOutEx&) {
-        lConditional.unlock();
-        ADD_FAILURE() << "wake-up lost at turn " << lTurn;
-        return;
-      }
-      ++lTurn;
-      lConditional.signal();
-      lConditional.unlock();
-    }
-  };
-  std::thread lPing(lPlayer, 0), lPong(lPlayer, 1);
-  lPing.join();
-  lPong.join();
-  EXPECT_EQ(4000, lTurn);
-}
-
-// The locker holds the mutex for its scope and releases it on an exception. Destroying a mutex
-// that is still locked makes pthread_mutex_destroy fail with EBUSY; the destructor swallows that.
-TEST(MutexTest, LockerReleasesOnExceptionAndDestroyingALockedMutexIsSwallowed) {
-  QNCMutex lMutex;
-  try {
-    QNCMutexLocker lLocker(lMutex);
-    EXPECT_EQ(EBUSY, pthread_mutex_trylock(&lMutex.getMutex())) << "the locker did not take the mutex";
-    throw QNCInvalidEx("leave the scope", 1);
-  } catch (QNCInvalidEx&) {
-  }
-  ASSERT_EQ(0, pthread_mutex_trylock(&lMutex.getMutex())) << "the locker kept the mutex after an exception";
-  lMutex.unlock();
+// Destroying a mutex that is still locked makes pthread_mutex_destroy fail with EBUSY; the
+// destructor swallows that and leaves the system mutex as it was: still valid and locked.
+TEST(MutexTest, DestroyingALockedMutexIsSwallowed) {
 #if !defined(__SANITIZE_THREAD__)  // ThreadSanitizer reports exactly what this provokes
   alignas(QNCMutex) unsigned char lStorage[sizeof(QNCMutex)];
   QNCMutex* lpMutex = new (lStorage) QNCMutex();
   pthread_mutex_t* lpSystemMutex = &lpMutex->getMutex();
   lpMutex->lock();
   EXPECT_NO_THROW(lpMutex->~QNCMutex());
-  // The failed destroy left the system mutex as it was: still valid and locked.
   EXPECT_EQ(0, pthread_mutex_unlock(lpSystemMutex));
   EXPECT_EQ(0, pthread_mutex_destroy(lpSystemMutex));
 #endif

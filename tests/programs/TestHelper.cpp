@@ -5,24 +5,15 @@
 //                                     print "running <pid>", wait for SIGTERM, release, exit 0
 //   hold-stubborn <pid-file> <log>    as hold, but SIGTERM is ignored: only SIGKILL ends it
 //   kill <pid-file> <log>             stop the running instance recorded in the file
-//   daemon <report> <go-file>         daemonize, wait for <go-file>, write "key=value" lines and
-//                                     "done" to <report>; the daemon must not inherit the two
-//                                     descriptors left open before (one at the top of the limit)
-//   log-startup|log-daemon|log-exit|log-badpath <log>, log-crash <log> <signal>
+//   log-startup|log-exit <log>, log-crash <log> <signal>
 //                                     one logger scenario that needs a process of its own
-//   run|linger [<requests>], throw <step>
+//   run|linger [<requests>]
 //                                     a service on the start-up and shut-down driver (see Driver)
 //
-// A QNCException is printed to standard error as "error: <message> (code <n>)", exit status 1;
-// SystemMain throwing gives status 3.
+// A QNCException is printed to standard error as "error: <message> (code <n>)", exit status 1.
 
-#include <dirent.h>
-#include <fcntl.h>
 #include <signal.h>
 #include <sys/mman.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -34,7 +25,6 @@
 #include <string>
 #include <thread>
 
-#include "Assert.h"
 #include "Logger.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
@@ -84,52 +74,6 @@ int instance(const std::string& acrMode, int argc, char** argv) {
   return 0;
 }
 
-std::string linkTarget(const std::string& acrPath) {
-  char lTarget[4096];
-  const ssize_t lLength = readlink(acrPath.c_str(), lTarget, sizeof lTarget - 1);
-  return lLength < 0 ? std::string("(closed)") : std::string(lTarget, static_cast<size_t>(lLength));
-}
-
-void report(const char* apReportPath) {
-  std::string lOthers;  // descriptors open besides 0, 1 and 2
-  DIR* lpDir = opendir("/proc/self/fd");
-  while (const dirent* lpEntry = lpDir == nullptr ? nullptr : readdir(lpDir)) {
-    const int lFd = atoi(lpEntry->d_name);
-    if (lpEntry->d_name[0] != '.' && lFd > 2 && lFd != dirfd(lpDir))
-      lOthers += (lOthers.empty() ? "" : ",") + std::to_string(lFd);
-  }
-  if (lpDir != nullptr) closedir(lpDir);
-  char lCwd[4096] = "(unknown)";
-  if (getcwd(lCwd, sizeof lCwd) == nullptr) snprintf(lCwd, sizeof lCwd, "(unknown)");
-  struct sigaction lHup = {};
-  sigaction(SIGHUP, nullptr, &lHup);
-  const std::string lTemporary = std::string(apReportPath) + ".tmp";
-  FILE* lpOut = fopen(lTemporary.c_str(), "w");
-  if (lpOut == nullptr) return;
-  fprintf(lpOut, "pid=%d\nppid=%d\nsid=%d\ncwd=%s\numask=%o\nsighup=%s\n", getpid(), getppid(), getsid(0),
-          lCwd, umask(0), lHup.sa_handler == SIG_IGN ? "ignored" : "other");
-  for (int lFd = 0; lFd <= 2; ++lFd)
-    fprintf(lpOut, "fd%d=%s\n", lFd, linkTarget("/proc/self/fd/" + std::to_string(lFd)).c_str());
-  fprintf(lpOut, "others=%s\ndone\n", lOthers.c_str());
-  fclose(lpOut);
-  rename(lTemporary.c_str(), apReportPath);  // the test never sees half a report
-}
-
-int daemonProbe(char** argv) {
-  const int lInherited = open("/dev/null", O_RDONLY);
-  struct rlimit lLimit;
-  getrlimit(RLIMIT_NOFILE, &lLimit);
-  dup2(lInherited, static_cast<int>(lLimit.rlim_cur - 1));
-  try {
-    qntest::TableSystem(0, 0, 0).systemDaemonize("/", "/dev/null", "/dev/null", "/dev/null");
-  } catch (const QNCParentExitEx&) {
-    return 0;
-  }
-  waitForFile(argv[3]);
-  report(argv[2]);
-  return 0;
-}
-
 int logger(const std::string& acrMode, int argc, char** argv) {
   const char* lpLog = argv[2];
   if (acrMode == "log-startup") {
@@ -143,19 +87,8 @@ int logger(const std::string& acrMode, int argc, char** argv) {
     destroyLogger();
     QN_LOG_TRACE("after destroy %d", 6);
     QN_LOG_ERROR("after destroy %d", 7);
-  } else if (acrMode == "log-daemon") {
-    QN_LOG_TRACE("before fork in %d", static_cast<int>(getpid()));
-    const pid_t lChild = fork();
-    if (lChild > 0) {
-      int lStatus = 0;
-      waitpid(lChild, &lStatus, 0);
-      return WIFEXITED(lStatus) ? WEXITSTATUS(lStatus) : 3;
-    }
-    CreateLogger(lpLog);
-    QN_LOG_NOTICE("child opened the log");
-    destroyLogger();
   } else if (acrMode == "log-exit") {
-    // exit(1) by a failed assertion while another thread keeps logging.
+    // exit(1) with lines buffered while another thread keeps logging.
     CreateLogger(lpLog);
     std::atomic<bool> lStarted{false};
     std::thread([&lStarted] {
@@ -166,7 +99,7 @@ int logger(const std::string& acrMode, int argc, char** argv) {
     }).detach();
     while (!lStarted.load()) std::this_thread::yield();
     for (int lIndex = 0; lIndex < 1000; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
-    QN_ASSERT(lStarted.load() == false);
+    exit(1);
   } else if (acrMode == "log-crash" && argc > 3) {
     CreateLogger(lpLog);
     for (int lIndex = 0; lIndex < 100; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
@@ -180,10 +113,6 @@ int logger(const std::string& acrMode, int argc, char** argv) {
     if (lSignal == SIGABRT) abort();
     raise(lSignal);
     return 4;  // the signal did not end the process
-  } else if (acrMode == "log-badpath") {
-    CreateLogger(lpLog);
-    QN_LOG_INFO("still here");
-    say("went on");
   } else {
     return 2;
   }
@@ -194,15 +123,12 @@ int logger(const std::string& acrMode, int argc, char** argv) {
 // without calling the base, so the tests see the driver's sequence alone. Each logs "step <name>"
 // ($QN_LOG_DIR/driver_app.log) and prints "<name>" at once. "run": parseConfigFile throws
 // QNCNotImplementedEx as a service without a configuration file does; "linger": it succeeds and
-// the process lives a second past SystemMain; "throw <step>": that step throws QNCExistsEx.
+// the process lives a second past SystemMain.
 // waitForThreads blocks until makeThreadsToExit has been called <requests> times.
 class Driver : public qntest::TableSystem {
  public:
-  Driver(std::string aMode, std::string aFailingStep, unsigned int aRequests)
-      : TableSystem(0, 0, 0),
-        mMode(std::move(aMode)),
-        mFailingStep(std::move(aFailingStep)),
-        mExpected(aRequests) {}
+  Driver(std::string aMode, unsigned int aRequests)
+      : TableSystem(0, 0, 0), mMode(std::move(aMode)), mExpected(aRequests) {}
   ~Driver() override { step("destructor"); }
 
   void preInit() override { step("preInit"); }
@@ -247,10 +173,9 @@ class Driver : public qntest::TableSystem {
   void step(const char* apName) {
     QN_LOG_NOTICE("step %s", apName);
     say(apName);
-    if (mFailingStep == apName) throw QNCExistsEx((std::string("injected failure in ") + apName).c_str(), 10);
   }
 
-  const std::string mMode, mFailingStep;
+  const std::string mMode;
   const unsigned int mExpected;
   std::mutex mLock;  // guards mRequests
   std::condition_variable mChanged;
@@ -258,16 +183,9 @@ class Driver : public qntest::TableSystem {
 };
 
 int driver(const std::string& acrMode, int argc, char** argv) {
-  const bool lThrow = acrMode == "throw";
-  const unsigned int lRequests = !lThrow && argc > 2 ? static_cast<unsigned int>(atoi(argv[2])) : 1;
-  try {
-    setSystemObject(new Driver(acrMode, lThrow && argc > 2 ? argv[2] : "", lRequests));
-    setLogFilePath("driver_app.log");
-    SystemMain(argc, argv);
-  } catch (const QNCException& acrException) {
-    say(std::string("SystemMain threw: ") + acrException.what());
-    return 3;
-  }
+  setSystemObject(new Driver(acrMode, argc > 2 ? static_cast<unsigned int>(atoi(argv[2])) : 1));
+  setLogFilePath("driver_app.log");
+  SystemMain(argc, argv);
   say("SystemMain returned");
   if (acrMode == "linger") {
     // The tests send signals now; with their default effect any of them would end the process.
@@ -284,9 +202,8 @@ int main(int argc, char** argv) {
   try {
     if ((lMode == "hold" || lMode == "hold-stubborn" || lMode == "kill") && argc > 3)
       return instance(lMode, argc, argv);
-    if (lMode == "daemon" && argc > 3) return daemonProbe(argv);
     if (lMode.compare(0, 4, "log-") == 0 && argc > 2) return logger(lMode, argc, argv);
-    if (lMode == "run" || lMode == "linger" || lMode == "throw") return driver(lMode, argc, argv);
+    if (lMode == "run" || lMode == "linger") return driver(lMode, argc, argv);
   } catch (const QNCException& acrException) {
     fprintf(stderr, "error: %s (code %u)\n", acrException.what(), acrException.getCode());
     return 1;
