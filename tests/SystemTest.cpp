@@ -2,14 +2,11 @@
 // starting and stopping the threads, the settings and the common command-line options.
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <cstdlib>
 #include <thread>
 
-#include "DeathTestSupport.h"
-#include "IpAddress.h"
 #include "LogSupport.h"
 #include "MultiType.h"
 #include "Mutex.h"
@@ -23,7 +20,6 @@
 namespace {
 
 using qntest::expectInOrder;
-using qntest::levelOf;
 
 // The log path setLogFilePath composes with QN_LOG_DIR set to apDir (unset when null), and the
 // log directory then reported. The directory is read from the environment each time.
@@ -47,35 +43,6 @@ TEST(DriverTest, LogPathIsTheVariableOrTmpAndTheNameCutTo511Characters) {
   EXPECT_EQ(("/var/log/app/" + lLong).substr(0, 511) + "|/var/log/app", composed("/var/log/app", lLong));
   EXPECT_EQ("/tmp/a|/tmp", composed(nullptr, "a"));  // nothing of the long one is left behind
   unsetenv("QN_LOG_DIR");
-}
-
-// Run in a child process: the registration must not outlive the test.
-bool gsFirstDeleted = false;
-struct FirstSystem : qntest::TableSystem {
-  ~FirstSystem() override { gsFirstDeleted = true; }
-};
-
-TEST(DriverTest, SecondRegistrationReplacesTheFirstWithoutDeletingIt) {
-  EXPECT_EXIT(
-      {
-        static FirstSystem* spFirst = new FirstSystem;  // kept reachable for the leak checker
-        setSystemObject(spFirst);
-        auto* lpSecond = new qntest::TableSystem;
-        setSystemObject(lpSecond);
-        QNCSystem* lpSeen = nullptr;
-        getSystemObject(lpSeen);
-        exit(lpSeen == lpSecond && !gsFirstDeleted ? 0 : 2);
-      },
-      ::testing::ExitedWithCode(0), "");
-}
-
-TEST(DriverDeathTest, RegisteringNullOrRunningWithoutAnObjectIsAnAssertion) {
-  char lName[] = "driver";
-  char* lArgv[] = {lName, nullptr};
-  EXPECT_EXIT(setSystemObject(nullptr), ::testing::ExitedWithCode(1),
-              qntest::assertionFailure("0UL != apSystem"));
-  EXPECT_EXIT(SysInit(1, lArgv), ::testing::ExitedWithCode(1), qntest::assertionFailure("0 != gspSystem"));
-  EXPECT_EXIT(SysExit(), ::testing::ExitedWithCode(1), qntest::assertionFailure("0 != gspSystem"));
 }
 
 // --- Threads. A component that sleeps until asked to exit, or one that ends by itself at once
@@ -117,10 +84,6 @@ class ThreadsSystem : public qntest::TableSystem {
     }
     waitForThreads();
   }
-  // Counts only calls made once both parsers exist: the application's descriptors go into them.
-  void setCommandLineArgumentDesc() override {
-    mDescriptorCalls += !mCommandLineParser.isNull() && !mConfigFileParser.isNull();
-  }
   void createShutDownEvent() override {
     ++mShutDownEvents;
     mFlagAtShutDownEvent = isSetForExit();
@@ -136,7 +99,7 @@ class ThreadsSystem : public qntest::TableSystem {
     return *lpPool;
   }
 
-  int mDescriptorCalls = 0, mShutDownEvents = 0;
+  int mShutDownEvents = 0;
   bool mFlagAtShutDownEvent = true;
 };
 
@@ -160,14 +123,12 @@ TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
   EXPECT_THROW(lWorkers.submit([] {}), QNCExitConditionEx);
   EXPECT_THROW(lSpare.submit([] {}), QNCExitConditionEx);
   lSystem.waitForThreads();  // returns: every thread was told
-  const std::string lLog = log();
   expectInOrder(
-      lLog, {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
-             "Started Threads in Thread Pool: spare\n", "Waiting for 'alpha' thread to exit\n",
-             "Waiting for 'beta' thread to exit\n", "Waiting for threads in 'workers' ThreadPool to exit\n",
-             "Waiting for threads in 'spare' ThreadPool to exit\n"});
-  EXPECT_EQ("-N-", levelOf(lLog, "Started Thread: alpha"));
-  EXPECT_EQ("-N-", levelOf(lLog, "Waiting for threads in 'workers' ThreadPool to exit"));
+      log(),
+      {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
+       "Started Threads in Thread Pool: spare\n", "Waiting for 'alpha' thread to exit\n",
+       "Waiting for 'beta' thread to exit\n", "Waiting for threads in 'workers' ThreadPool to exit\n",
+       "Waiting for threads in 'spare' ThreadPool to exit\n"});
 }
 
 // Nothing is caught in startThreads: the component that cannot start ends it, and neither the
@@ -204,26 +165,6 @@ TEST_F(SystemTest, ExitFlagIsSetFirstAndNeverReturnsToFalse) {
   EXPECT_TRUE(lSystem.isSetForExit());
 }
 
-TEST_F(SystemTest, PreInitCreatesTheParsersFirstAndInitFindsTheHostName) {
-  ThreadsSystem lSystem;
-  lSystem.preInit();
-  EXPECT_EQ(QNOS_Linux, lSystem.getOs());
-  EXPECT_EQ(1, lSystem.mDescriptorCalls);
-  lSystem.init();
-  char lHostName[256] = {0};
-  ASSERT_EQ(0, gethostname(lHostName, sizeof lHostName - 1));
-  EXPECT_STREQ(lHostName, lSystem.getHostName().get());
-  ASSERT_FALSE(lSystem.getAddress().isNull());
-  const std::string lLog = log();
-  expectInOrder(lLog, {std::string("HostName: ") + lHostName + "\n",
-                       "IpAddress: " + std::string(lSystem.getAddress()->getStringForm()) + "\n"});
-  EXPECT_EQ("-I-", levelOf(lLog, "The IP Address of the host in number form: "));
-  // init() creates the identifier manager, starting at 1.
-  unsigned int lId = 0;
-  lSystem.generateNumericId(lId);
-  EXPECT_EQ(1u, lId);
-}
-
 // --- Settings. applySettings changes the process-wide log mask and heartbeat: restored after.
 class SettingsSystem : public qntest::TableSystem {
  public:
@@ -245,37 +186,32 @@ class SettingsSystem : public qntest::TableSystem {
   std::vector<std::string> mDaemonizeCalls;
 };
 
+unsigned int current(void (*apGet)(unsigned int&)) {
+  unsigned int lValue = 0;
+  apGet(lValue);
+  return lValue;
+}
+
 class SettingsTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    getLogCode(mSavedLogCode);
-    getHbTimeout(mSavedHbTimeout);
-  }
   void TearDown() override {
     setLogCode(mSavedLogCode);
     setHbTimeout(mSavedHbTimeout);
   }
-  static unsigned int logCode() {
-    unsigned int lValue = 0;
-    getLogCode(lValue);
-    return lValue;
-  }
-  static unsigned int hbTimeout() {
-    unsigned int lValue = 0;
-    getHbTimeout(lValue);
-    return lValue;
-  }
 
   SettingsSystem mSystem;
-  unsigned int mSavedLogCode = 0, mSavedHbTimeout = 0;
+  const unsigned int mSavedLogCode = current(getLogCode), mSavedHbTimeout = current(getHbTimeout);
 };
 
-TEST_F(SettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
+// Daemonize 1 (and nothing else) daemonizes. With -c the file must supply the three keys; a
+// missing one ends start-up after the earlier ones were applied. A value of the wrong kind is an
+// exception, not a value.
+TEST_F(SettingsTest, ApplySettingsSetsTheLoggerDaemonizesOnlyForOneAndStopsAtABadKey) {
   mSystem.addAll(new QNCMultiType(121u), new QNCMultiType(45u),
                  new QNCMultiType(static_cast<signed char>(1)));
   mSystem.applySettings();
-  EXPECT_EQ(121u, logCode());
-  EXPECT_EQ(45u, hbTimeout());
+  EXPECT_EQ(121u, current(getLogCode));
+  EXPECT_EQ(45u, current(getHbTimeout));
   EXPECT_EQ(std::vector<std::string>{"/|/dev/null|/dev/null|/dev/null"}, mSystem.mDaemonizeCalls);
   for (signed char lOther : {0, 2, -1}) {
     SettingsSystem lSystem;
@@ -283,18 +219,12 @@ TEST_F(SettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
     lSystem.applySettings();
     EXPECT_TRUE(lSystem.mDaemonizeCalls.empty()) << static_cast<int>(lOther);
   }
-}
-
-// With -c the file must supply the three keys; a missing one ends start-up after the earlier
-// ones were applied. A value of the wrong kind is an exception, not a value.
-TEST_F(SettingsTest, ApplySettingsStopsAtTheFirstMissingOrWrongKey) {
-  setHbTimeout(30);
-  mSystem.addAll(new QNCMultiType(249u), nullptr, new QNCMultiType(static_cast<signed char>(1)));
-  EXPECT_THROW(mSystem.applySettings(), QNCNotFoundEx);
-  EXPECT_EQ(249u, logCode());
-  EXPECT_EQ(30u, hbTimeout());
-  EXPECT_TRUE(mSystem.mDaemonizeCalls.empty());
-  SettingsSystem lWrongKind;
+  SettingsSystem lMissing, lWrongKind;
+  lMissing.addAll(new QNCMultiType(249u), nullptr, new QNCMultiType(static_cast<signed char>(1)));
+  EXPECT_THROW(lMissing.applySettings(), QNCNotFoundEx);
+  EXPECT_EQ(249u, current(getLogCode));
+  EXPECT_EQ(30u, current(getHbTimeout));
+  EXPECT_TRUE(lMissing.mDaemonizeCalls.empty());
   lWrongKind.addAll(new QNCMultiType("16"), new QNCMultiType(30u), new QNCMultiType(1u));
   EXPECT_THROW(lWrongKind.applySettings(), QNCInvalidEx);
 }
@@ -332,17 +262,31 @@ TEST_F(SettingsTest, ConcurrentThreadsNeverHoldTheSameIdentifier) {
   EXPECT_EQ(0u, lFaults.load());
 }
 
+// Identifiers start at 1 and returned ones come back first; one never issued, or returned twice,
+// is refused (a double return would hand it to two users), and so is a request past the bound.
 // A refusal that left mNidCreationLock held would block the next call for ever.
-TEST_F(SettingsTest, IdentifierRefusalsLeaveTheLockFree) {
+TEST_F(SettingsTest, IdentifiersAreReusedAndRefusalsLeaveTheLockFree) {
+  mSystem.useIdentifierBound(4);
   unsigned int lId = 0;
-  mSystem.useIdentifierBound(2);
-  mSystem.generateNumericId(lId);
-  mSystem.generateNumericId(lId);
-  EXPECT_THROW(mSystem.generateNumericId(lId), QNCNotFoundEx);
-  EXPECT_THROW(mSystem.returnNumericId(7), QNCInvalidEx);
+  auto lNext = [&] {
+    mSystem.generateNumericId(lId);
+    return lId;
+  };
+  for (unsigned int lExpected = 1; lExpected <= 3; ++lExpected) EXPECT_EQ(lExpected, lNext());
+  mSystem.returnNumericId(3);
   mSystem.returnNumericId(1);
-  mSystem.generateNumericId(lId);
-  EXPECT_EQ(1u, lId);
+  EXPECT_EQ("Numeric identifier 0 is not in use, cannot return it",
+            qntest::thrown<QNCInvalidEx>([&] { mSystem.returnNumericId(0); }));
+  for (unsigned int lRefused : {1u, 4u}) EXPECT_THROW(mSystem.returnNumericId(lRefused), QNCInvalidEx);
+  EXPECT_EQ(3u, lNext());
+  EXPECT_EQ(1u, lNext());
+  EXPECT_EQ(4u, lNext());
+  lId = 77;
+  EXPECT_EQ("No numeric identifier is free: all of 1..4 are in use",
+            qntest::thrown<QNCNotFoundEx>([&] { mSystem.generateNumericId(lId); }));
+  EXPECT_EQ(77u, lId);
+  mSystem.returnNumericId(2);
+  EXPECT_EQ(2u, lNext());
 }
 
 // --- The common command-line options, run in-process. The instance operations are faked so that
@@ -354,15 +298,12 @@ const QNSCommandLineArgumentDesc kCommonOptions[] = {
 
 class CommandLineSystem : public qntest::TableSystem {
  public:
-  explicit CommandLineSystem(bool aConfigAsFlag = false) : mConfigAsFlag(aConfigAsFlag) {
+  CommandLineSystem() {
     mName = "sensortest";
     mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("9.8.7"));
   }
   void setCommandLineArgumentDesc() override {
-    for (QNSCommandLineArgumentDesc lDesc : kCommonOptions) {
-      if (mConfigAsFlag && std::string(lDesc.mOption) == "-c") lDesc.mTakesValue = 0;
-      mCommandLineArgumentDesc.append(lDesc);
-    }
+    for (const QNSCommandLineArgumentDesc& lrDesc : kCommonOptions) mCommandLineArgumentDesc.append(lrDesc);
   }
   bool isAnInstanceRunning() override {
     printf("[checked]");
@@ -387,9 +328,6 @@ class CommandLineSystem : public qntest::TableSystem {
   }
   unsigned int settingCount() const { return mSettings.numberOfElements(); }
   bool mInstanceRunning = false;
-
- private:
-  bool mConfigAsFlag;
 };
 
 // Logs to a file of its own, with a recognisable log mask and heartbeat, so the defaults can be
@@ -453,12 +391,6 @@ TEST_F(CommandLineTest, ShutdownStopsTheRunningInstanceAndLeavesWithParentExit) 
     EXPECT_EQ(0u, lSystem.settingCount());
   }
   EXPECT_NE(std::string::npos, log().find("No instance running.. cannot kill"));
-}
-
-TEST(CommandLineDeathTest, ConfigFileDescribedWithoutValueIsAnAssertion) {
-  CommandLineSystem lSystem(true);
-  EXPECT_EXIT(lSystem.process({"-c"}), ::testing::ExitedWithCode(1),
-              "Assertion \\[ __null != lpArg \\] failed");
 }
 
 }  // namespace

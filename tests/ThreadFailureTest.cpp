@@ -5,7 +5,10 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
 #include <stdexcept>
+#include <string>
+#include <vector>
 
 #include "DeathTestSupport.h"
 #include "LogSupport.h"
@@ -102,19 +105,27 @@ TEST_F(ThreadFailureTest, DyingThreadFailsTheRunAndEndsTheOthers) {
   EXPECT_EQ("-E-", qntest::levelOf(log(), "Thread 'Dying' ended by an exception: sensor bus gone"));
 }
 
-// A pool task that throws fails the run the same way; the worker goes on with the next task.
+// A pool task that throws fails the run the same way, whatever it throws (an exception leaving
+// the thread function would call std::terminate); the worker goes on with the next task. The
+// text of the error line is shared with the components' own.
 TEST_F(ThreadFailureTest, FailingPoolTaskFailsTheRun) {
   const int lBefore = gsExitRequests.load();
+  const std::vector<std::pair<std::function<void()>, std::string>> lCases = {
+      {[] { throw QNCInvalidEx("sensor lost", 6); }, "sensor lost"},
+      {[] { throw std::runtime_error("report lost"); }, "report lost"},
+      {[] { throw 42; }, "unknown exception"}};
   QNCThreadPool lPool("Failing", 1);
   std::atomic<int> lLaterTasks{0};
   lPool.init();
-  lPool.submit([] { throw std::runtime_error("report lost"); });
+  for (const auto& lrCase : lCases) lPool.submit(lrCase.first);
   lPool.submit([&lLaterTasks] { ++lLaterTasks; });
   lPool.finish();
   lPool.waitForThreads();
   EXPECT_EQ(1, lLaterTasks.load());
-  EXPECT_EQ(lBefore + 1, gsExitRequests.load());
-  EXPECT_EQ("-E-", qntest::levelOf(log(), "ThreadPool 'Failing': task failed: report lost"));
+  EXPECT_EQ(lBefore + 3, gsExitRequests.load());
+  const std::string lLog = log();
+  for (const auto& lrCase : lCases)
+    EXPECT_EQ("-E-", qntest::levelOf(lLog, "ThreadPool 'Failing': task failed: " + lrCase.second)) << lLog;
 }
 
 }  // namespace

@@ -7,7 +7,6 @@
 #include <condition_variable>
 #include <future>
 #include <mutex>
-#include <stdexcept>
 
 #include "LogSupport.h"
 #include "ThreadComponent.h"
@@ -178,39 +177,6 @@ TEST(ThreadPoolTest, MisuseIsRefusedWithClearErrors) {
   lPool.waitForThreads();
   lPool.waitForThreads();  // already joined
   EXPECT_EQ(1, lRefused);
-}
-
-// An exception leaving a thread function would call std::terminate; from a component's body or a
-// pool's task each kind is logged at error level with its message, and the pool's worker (the
-// only one) goes on to run the task after it.
-class ThreadsLogTest : public qntest::LoggedTest {};
-
-TEST_F(ThreadsLogTest, AnExceptionFromABodyOrATaskIsLoggedAndWorkGoesOn) {
-  const std::vector<std::pair<std::function<void()>, std::string>> lCases = {
-      {[] { throw QNCInvalidEx("sensor lost", 6); }, "sensor lost"},
-      {[] { throw std::runtime_error("bus error"); }, "bus error"},
-      {[] { throw 42; }, "unknown exception"}};
-  std::atomic<int> lAfter{0};
-  {
-    QNCThreadPool lPool("fragile", 1);
-    lPool.init();
-    for (const auto& lrCase : lCases) {
-      ScriptedComponent lComponent([&](ScriptedComponent&) { lrCase.first(); });
-      lComponent.init();
-      lComponent.waitForExit();
-      lPool.submit(lrCase.first);
-    }
-    lPool.submit([&] { ++lAfter; });
-    lPool.finish();
-    lPool.waitForThreads();
-  }
-  EXPECT_EQ(1, lAfter);
-  const std::string lLog = log();
-  for (const auto& lrCase : lCases) {
-    EXPECT_EQ("-E-", qntest::levelOf(lLog, "Thread 'scripted' ended by an exception: " + lrCase.second))
-        << lLog;
-    EXPECT_EQ("-E-", qntest::levelOf(lLog, "ThreadPool 'fragile': task failed: " + lrCase.second)) << lLog;
-  }
 }
 
 }  // namespace
