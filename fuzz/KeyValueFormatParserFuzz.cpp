@@ -30,29 +30,18 @@
 
 namespace {
 
-int gMemoryFile = -1;
-std::string gPath;
-
-// Replaces the memory file's contents with the input's.
-void store(const uint8_t* apData, size_t aSize) {
-  QN_FUZZ_CHECK(ftruncate(gMemoryFile, 0) == 0 && lseek(gMemoryFile, 0, SEEK_SET) == 0);
-  qnfuzz::writeAll(gMemoryFile, apData, aSize);
-}
+std::string gPath;  // the memory file's /proc/self/fd path, made on the first input
 
 std::string folded(const char* apText, bool aFold) {
   std::string lText(apText);
-  if (aFold) {
-    for (char& lrChar : lText) {
-      if (lrChar >= 'A' && lrChar <= 'Z') lrChar = static_cast<char>(lrChar - 'A' + 'a');
-    }
-  }
+  for (char& lrChar : lText) lrChar = aFold && lrChar >= 'A' && lrChar <= 'Z' ? lrChar - 'A' + 'a' : lrChar;
   return lText;
 }
 
 bool isBlank(char aChar) { return aChar == ' ' || aChar == '\t' || aChar == '\r'; }
 
-bool startsWith(const char* apText, const std::string& acrPrefix) {
-  return strncmp(apText, acrPrefix.c_str(), acrPrefix.size()) == 0;
+bool startsWithPath(const char* apText) {
+  return strncmp(apText, (gPath + ":").c_str(), gPath.size() + 1) == 0;
 }
 
 // getUnsigned() agrees with an independent reading of the value as a decimal unsigned int.
@@ -97,17 +86,11 @@ void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& ac
 
 }  // namespace
 
-// The memory file is made once, on the first input.
-void openMemoryFile() {
-  if (gMemoryFile >= 0) return;
-  gMemoryFile = memfd_create("qnfuzz-config", MFD_CLOEXEC);
-  QN_FUZZ_CHECK(gMemoryFile >= 0);
-  gPath = "/proc/self/fd/" + std::to_string(gMemoryFile);
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
+  static const int sMemoryFile = memfd_create("qnfuzz-config", MFD_CLOEXEC);
+  QN_FUZZ_CHECK(sMemoryFile >= 0);
   if (aSize == 0) return 0;
-  openMemoryFile();
+  gPath = "/proc/self/fd/" + std::to_string(sMemoryFile);
   const uint8_t lFlags = apData[0];
   const bool lFold = (lFlags & 1) != 0;
   const bool lAllowDuplicates = (lFlags & 2) != 0;
@@ -117,7 +100,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
     lSkip = 2;
     if (apData[1] != 0) lMarkers = std::string(1, static_cast<char>(apData[1]));
   }
-  store(apData + lSkip, aSize - lSkip);
+  QN_FUZZ_CHECK(ftruncate(sMemoryFile, 0) == 0 && lseek(sMemoryFile, 0, SEEK_SET) == 0);
+  qnfuzz::writeAll(sMemoryFile, apData + lSkip, aSize - lSkip);
   unsigned int lLineCount = 1;
   for (size_t lIndex = lSkip; lIndex < aSize; ++lIndex) lLineCount += apData[lIndex] == '\n' ? 1 : 0;
 
@@ -129,11 +113,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
     lParser.parse();
     lParsed = true;
   } catch (const QNCInvalidEx& acrException) {
-    QN_FUZZ_CHECK(startsWith(acrException.what(), gPath + ":"));
+    QN_FUZZ_CHECK(startsWithPath(acrException.what()));
     QN_FUZZ_CHECK(strstr(acrException.what(), "expected 'key = value'") != nullptr);
   } catch (const QNCExistsEx& acrException) {
     QN_FUZZ_CHECK(!lAllowDuplicates);
-    QN_FUZZ_CHECK(startsWith(acrException.what(), gPath + ":"));
+    QN_FUZZ_CHECK(startsWithPath(acrException.what()));
   } catch (const QNCException&) {
     // Another member of the family (no memory, an unreadable file): a clear error as well.
   } catch (...) {

@@ -87,44 +87,35 @@ class SystemContainerTest : public ::testing::TestWithParam<Container> {
   qntest::TableSystem mSystem{1, 2, 2};
 };
 
-TEST_P(SystemContainerTest, ElementsLeaveTheirOwnContainerInTheOrderTheyCame) {
-  for (int lId = 1; lId <= 3; ++lId) put(0, makeItem(lId));
+// Each removal from an empty container releases its lock on the way out (the put that follows
+// would otherwise block for ever); the front stays in place; a take hands its reference over and
+// a clear releases each of the container's own once.
+TEST_P(SystemContainerTest, OrderEmptyTakesAndReleasedReferences) {
+  const std::function<void()> lTakesFromEmpty[] = {[&] { take(0); }, [&] { (mSystem.*GetParam().mFront)(0); },
+                                                   [&] { mSystem.delistBack(0); }};
+  for (const auto& lrTake : lTakesFromEmpty) {
+    EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lrTake, true));
+    ASSERT_TRUE(qntest::returnsWithin([&] { put(0, makeItem(0)); }, 10s));
+    EXPECT_EQ(0, idOf(take(0)));
+  }
+  std::atomic<int> lDestroyed{0};
+  for (int lId = 1; lId <= 3; ++lId) put(0, makeItem(lId, &lDestroyed));
   put(1, makeItem(5));
   EXPECT_EQ(1, idOf((mSystem.*GetParam().mFront)(0)));
-  EXPECT_EQ(1, idOf(take(0)));  // the front was left in place
-  EXPECT_EQ(2, idOf(take(0)));
-  put(0, makeItem(4));
-  EXPECT_EQ(3, idOf(take(0)));
-  EXPECT_EQ(4, idOf(take(0)));
-  EXPECT_TRUE(isEmpty());
-  EXPECT_EQ(5, idOf(take(1)));
-}
-
-// Each removal from an empty container must release its lock on the way out: the put that
-// follows would otherwise block for ever.
-TEST_P(SystemContainerTest, TakingFromAnEmptyOneThrowsNotFoundAndLeavesItUsable) {
-  const std::vector<std::function<void()>> lTakes = {
-      [&] { take(0); }, [&] { (mSystem.*GetParam().mFront)(0); }, [&] { mSystem.delistBack(0); }};
-  for (int lRound = 0; lRound < 3; ++lRound) {
-    EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lTakes[lRound], true)) << lRound;
-    ASSERT_TRUE(qntest::returnsWithin([&] { put(0, makeItem(lRound)); }, 10s));
-    EXPECT_EQ(lRound, idOf(take(0)));
-  }
-}
-
-TEST_P(SystemContainerTest, TakeHandsOverAndClearReleasesEachReferenceOnce) {
-  std::atomic<int> lDestroyed{0};
-  const Element lKept = makeItem(3, &lDestroyed);
-  put(0, makeItem(1, &lDestroyed));
-  put(0, makeItem(2, &lDestroyed));
-  put(0, lKept);
   Element lTaken = take(0);
+  EXPECT_EQ(1, idOf(lTaken));
+  EXPECT_EQ(2, idOf(take(0)));
+  const Element lKept = makeItem(4, &lDestroyed);
+  put(0, lKept);
+  put(0, makeItem(6, &lDestroyed));
+  EXPECT_EQ(3, idOf(take(0)));
+  EXPECT_EQ(2, lDestroyed.load());  // 2 and 3, taken and dropped
   (mSystem.*GetParam().mClear)(0);
   EXPECT_TRUE(isEmpty());
-  EXPECT_EQ(1, lDestroyed.load());  // the two still held by this test survive
-  EXPECT_EQ(1, idOf(lTaken));
+  EXPECT_EQ(3, lDestroyed.load());  // 6; the two this test holds survive
   lTaken.reset();
-  EXPECT_EQ(2, lDestroyed.load());
+  EXPECT_EQ(4, lDestroyed.load());
+  EXPECT_EQ(5, idOf(take(1)));
 }
 
 // An element whose destructor uses the container it leaves: removing it must not hold the lock
@@ -257,25 +248,22 @@ class SystemWaitTest : public ::testing::Test {
 TEST_F(SystemWaitTest, WaitsReturnOnlyAfterASignalOnTheirOwnConditional) {
   mSystem.signal(0);
   EXPECT_THROW(mSystem.timedWait(0, 30), QNCTimeOutEx);
-  const std::function<void()> lWaits[] = {[&] { mSystem.wait(0); }, [&] { mSystem.timedWait(0, 20000); }};
-  for (const auto& lWait : lWaits) {
-    std::atomic<bool> lReturned{false};
-    std::thread lWaiter([&] {
-      EXPECT_NO_THROW(lWait());
-      lReturned = true;
-    });
-    for (int lRound = 0; lRound < 10; ++lRound) {
-      mSystem.signal(1);
-      std::this_thread::sleep_for(5ms);
-    }
-    EXPECT_FALSE(lReturned.load());
-    // The waiter may not be inside its wait yet when the first signal comes (that one is lost).
-    EXPECT_TRUE(qntest::eventually([&] {
-      mSystem.signal(0);
-      return lReturned.load();
-    }));
-    lWaiter.join();
+  std::atomic<bool> lReturned{false};
+  std::thread lWaiter([&] {
+    EXPECT_NO_THROW(mSystem.wait(0));
+    lReturned = true;
+  });
+  for (int lRound = 0; lRound < 10; ++lRound) {
+    mSystem.signal(1);
+    std::this_thread::sleep_for(5ms);
   }
+  EXPECT_FALSE(lReturned.load());
+  // The waiter may not be inside its wait yet when the first signal comes (that one is lost).
+  EXPECT_TRUE(qntest::eventually([&] {
+    mSystem.signal(0);
+    return lReturned.load();
+  }));
+  lWaiter.join();
 }
 
 // Regression: a signal given without the conditional's lock between the waiter's emptiness test

@@ -13,9 +13,6 @@
 #include "NumericIdManager.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
-#include "ThreadComponent.h"
-#include "ThreadPool.h"
-#include "Version.h"
 
 namespace {
 
@@ -45,34 +42,16 @@ TEST(DriverTest, LogPathIsTheVariableOrTmpAndTheNameCutTo511Characters) {
   unsetenv("QN_LOG_DIR");
 }
 
-// --- Threads. A component that sleeps until asked to exit, or one that ends by itself at once
-// but refuses exit requests with exception E.
-class WaitingComponent : public QNCThreadComponent {
- public:
-  explicit WaitingComponent(const char* apName) : QNCThreadComponent(apName) {}
-  ~WaitingComponent() override { waitForExit(); }
-
- protected:
-  void run() override {
-    while (!waitForExitRequest(3600u * 1000u)) {
-    }
-  }
-};
-
+// --- Threads. A component refuses exit requests with the exception it is given.
 template <class E>
-class RefusingComponent : public QNCThreadComponent {
- public:
-  explicit RefusingComponent(const char* apName) : QNCThreadComponent(apName) {}
-  ~RefusingComponent() override { waitForExit(); }
-  void requestExit() override {
-    ++mRequests;
+qntest::ScriptedComponent* refusing(const char* apName, std::atomic<int>& arRequests) {
+  auto* lpComponent = new qntest::ScriptedComponent([](qntest::ScriptedComponent&) {}, apName);
+  lpComponent->mRefuse = [&arRequests] {
+    ++arRequests;
     throw E("cannot take the request", 6);
-  }
-  std::atomic<int> mRequests{0};
-
- protected:
-  void run() override {}
-};
+  };
+  return lpComponent;
+}
 
 class ThreadsSystem : public qntest::TableSystem {
  public:
@@ -88,17 +67,6 @@ class ThreadsSystem : public qntest::TableSystem {
     ++mShutDownEvents;
     mFlagAtShutDownEvent = isSetForExit();
   }
-  template <class T>
-  T& addComponent(T* apComponent) {
-    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent, QNPST_Individual, QNPAT_New));
-    return *apComponent;
-  }
-  QNCThreadPool& addPool(const char* apName, unsigned int aThreads) {
-    auto* lpPool = new QNCThreadPool(apName, aThreads);
-    mThreadPools.append(QNCPointer<QNCThreadPool>(lpPool, QNPST_Individual, QNPAT_New));
-    return *lpPool;
-  }
-
   int mShutDownEvents = 0;
   bool mFlagAtShutDownEvent = true;
 };
@@ -108,9 +76,10 @@ class SystemTest : public qntest::LoggedTest {};
 // A component that refuses the exit request with QNCInvalidEx (as one never started does) must
 // not keep the components after it or any pool from being told, or waitForThreads would hang.
 TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
+  std::atomic<int> lRequests{0};  // outlives the system, whose destructor asks again
   ThreadsSystem lSystem;
-  auto& lRefusing = lSystem.addComponent(new RefusingComponent<QNCInvalidEx>("alpha"));
-  auto& lWaiting = lSystem.addComponent(new WaitingComponent("beta"));
+  lSystem.addComponent(refusing<QNCInvalidEx>("alpha", lRequests));
+  auto& lWaiting = lSystem.addComponent(new qntest::ScriptedComponent({}, "beta"));
   QNCThreadPool& lWorkers = lSystem.addPool("workers", 2);
   QNCThreadPool& lSpare = lSystem.addPool("spare", 1);
   EXPECT_FALSE(lSystem.isInited(0));
@@ -118,7 +87,7 @@ TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
   EXPECT_TRUE(lSystem.isInited(0) && lSystem.isInited(1));
   EXPECT_FALSE(lSystem.isInited(2));
   lSystem.makeThreadsToExit();
-  EXPECT_EQ(1, lRefusing.mRequests);
+  EXPECT_EQ(1, lRequests.load());
   EXPECT_TRUE(lWaiting.isExitRequested());
   EXPECT_THROW(lWorkers.submit([] {}), QNCExitConditionEx);
   EXPECT_THROW(lSpare.submit([] {}), QNCExitConditionEx);
@@ -132,28 +101,24 @@ TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
 }
 
 // Nothing is caught in startThreads: the component that cannot start ends it, and neither the
-// components after it nor the pools are started. startThread then starts the one named, alone.
+// components after it nor the pools are started: the service never runs without one of its threads.
 TEST_F(SystemTest, StartThreadsStopsAtTheFirstComponentThatCannotStart) {
   ThreadsSystem lSystem;
-  lSystem.addComponent(new WaitingComponent("first")).init();  // a second init() is refused
-  lSystem.addComponent(new WaitingComponent("second"));
-  lSystem.addComponent(new WaitingComponent("third"));
+  lSystem.addComponent(new qntest::ScriptedComponent({}, "first")).init();  // a second init() is refused
+  lSystem.addComponent(new qntest::ScriptedComponent({}, "second"));
   QNCThreadPool& lPool = lSystem.addPool("late", 1);
   EXPECT_THROW(lSystem.startThreads(), QNCInvalidEx);
   EXPECT_FALSE(lSystem.isInited(1));
   lPool.submit([] {});  // a pool that was never started still accepts work: it was not finished
   EXPECT_EQ(std::string::npos, log().find("Started Thread"));
-  EXPECT_EQ("Vector out of bounds access", qntest::thrown<QNCInvalidEx>([&] { lSystem.startThread(3); }));
-  lSystem.startThread(2);
-  EXPECT_FALSE(lSystem.isInited(1));
-  EXPECT_TRUE(lSystem.isInited(2));
 }
 
 // Only QNCInvalidEx is passed over: another refusal reaches the caller, the flag already set; the
 // shut-down event comes before the flag is set, and the flag never returns to false.
 TEST_F(SystemTest, ExitFlagIsSetFirstAndNeverReturnsToFalse) {
+  std::atomic<int> lRequests{0};  // outlives the system, whose destructor asks again
   ThreadsSystem lSystem;
-  lSystem.addComponent(new RefusingComponent<QNCNotFoundEx>("odd"));
+  lSystem.addComponent(refusing<QNCNotFoundEx>("odd", lRequests));
   lSystem.startThreads();
   EXPECT_FALSE(lSystem.isSetForExit());
   EXPECT_THROW(lSystem.makeThreadsToExit(), QNCNotFoundEx);
@@ -289,8 +254,8 @@ TEST_F(SettingsTest, IdentifiersAreReusedAndRefusalsLeaveTheLockFree) {
   EXPECT_EQ(2u, lNext());
 }
 
-// --- The common command-line options, run in-process. The instance operations are faked so that
-// "-s" can be followed without a second process; each call prints a marker.
+// --- The common command-line options, run in-process ("-s" is followed by QnsensordTest, with a
+// real instance to stop).
 const QNSCommandLineArgumentDesc kCommonOptions[] = {
     {"-v", 0, "", ""},     {"-h", 0, "", ""},        {"-s", 0, "", ""},     {"-c", 1, "file", ""},
     {"-d", 1, "mask", ""}, {"-b", 1, "seconds", ""}, {"-D", 1, "bool", ""}, {"-I", 1, "minutes", ""},
@@ -298,18 +263,10 @@ const QNSCommandLineArgumentDesc kCommonOptions[] = {
 
 class CommandLineSystem : public qntest::TableSystem {
  public:
-  CommandLineSystem() {
-    mName = "sensortest";
-    mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("9.8.7"));
-  }
+  CommandLineSystem() { mName = "sensortest"; }
   void setCommandLineArgumentDesc() override {
     for (const QNSCommandLineArgumentDesc& lrDesc : kCommonOptions) mCommandLineArgumentDesc.append(lrDesc);
   }
-  bool isAnInstanceRunning() override {
-    printf("[checked]");
-    return mInstanceRunning;
-  }
-  void killRunningInstance() override { printf("[killed]"); }
   // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest".
   void process(const std::vector<std::string>& acrArguments) {
     std::vector<std::string> lStorage{"sensortest"};
@@ -327,7 +284,6 @@ class CommandLineSystem : public qntest::TableSystem {
                                              : static_cast<int>(static_cast<unsigned int>(*lValue));
   }
   unsigned int settingCount() const { return mSettings.numberOfElements(); }
-  bool mInstanceRunning = false;
 };
 
 // Logs to a file of its own, with a recognisable log mask and heartbeat, so the defaults can be
@@ -374,23 +330,6 @@ TEST_F(CommandLineTest, GivenValuesReplaceOnlyTheirOwnDefaultsReadLikeAtoi) {
       log(), {"Command line : '-d 16 -I 30'", "Processed the command line successfully : -d 16 -I 30",
               "No arguments in command line", "The -I option is not specified, using default interval 15 min",
               "Zero/Invalid value specified for -I option. DB won't be reopened at fixed intervals"});
-}
-
-// -s stops a running instance, or says that there is none; either way the process leaves through
-// QNCParentExitEx before any setting is written.
-TEST_F(CommandLineTest, ShutdownStopsTheRunningInstanceAndLeavesWithParentExit) {
-  for (const bool lRunning : {true, false}) {
-    CommandLineSystem lSystem;
-    lSystem.mInstanceRunning = lRunning;
-    testing::internal::CaptureStdout();
-    const std::string lThrown = qntest::thrown<QNCParentExitEx>([&] { lSystem.process({"-s"}); }, true);
-    EXPECT_EQ(lRunning ? "Done.. time to exit (code 19)" : "Done (nothing).. time to exit (code 19)",
-              lThrown);
-    EXPECT_EQ(lRunning ? "[checked][killed]sensortest shutdown successfully.\n" : "[checked]",
-              testing::internal::GetCapturedStdout());
-    EXPECT_EQ(0u, lSystem.settingCount());
-  }
-  EXPECT_NE(std::string::npos, log().find("No instance running.. cannot kill"));
 }
 
 }  // namespace

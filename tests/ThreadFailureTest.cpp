@@ -20,38 +20,20 @@
 
 namespace {
 
-// Throws from run() aFailures times, then waits for its exit request.
-class FailingComponent : public QNCThreadComponent {
- public:
-  FailingComponent(const char* apName, int aFailures, bool aRestart)
-      : QNCThreadComponent(apName), mFailures(aFailures), mRestart(aRestart) {}
-  std::atomic<int> mRuns{0};
+// Throws from its body aFailures times, then waits for its exit request.
+qntest::ScriptedComponent* failing(const char* apName, int aFailures, bool aRestart) {
+  auto* lpComponent = new qntest::ScriptedComponent(
+      [aFailures](qntest::ScriptedComponent& arSelf) {
+        if (arSelf.mRuns.load() <= aFailures) throw std::runtime_error("sensor bus gone");
+        while (!arSelf.waitForExitRequest(1000)) {
+        }
+      },
+      apName);
+  lpComponent->mRestart = aRestart;
+  return lpComponent;
+}
 
- protected:
-  void run() override {
-    if (mRuns.fetch_add(1) < mFailures) throw std::runtime_error("sensor bus gone");
-    while (!waitForExitRequest(1000)) {
-    }
-  }
-  bool restartAfterFailure(const char* apWhat) override {
-    return mRestart ? true : QNCThreadComponent::restartAfterFailure(apWhat);
-  }
-
- private:
-  const int mFailures;
-  const bool mRestart;
-};
-
-class FailureSystem : public qntest::TableSystem {
- public:
-  FailureSystem() : TableSystem(0, 0, 0) {}
-  void add(QNCThreadComponent* apComponent) {
-    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent));
-  }
-  void add(QNCThreadPool* apPool) { mThreadPools.append(QNCPointer<QNCThreadPool>(apPool)); }
-};
-
-FailureSystem* gspSystem = nullptr;
+qntest::TableSystem* gspSystem = nullptr;
 std::atomic<int> gsExitRequests{0};
 void requestExit() {
   ++gsExitRequests;
@@ -69,14 +51,13 @@ class ThreadFailureTest : public qntest::LoggedTest {
     QNSetExitRequest(nullptr);
     LoggedTest::TearDown();
   }
-  FailureSystem mSystem;
+  qntest::TableSystem mSystem;
 };
 
 // Two failures, each restarted by the override: the third run serves until the exit request; the
 // run has not failed and nobody asked for an exit.
 TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
-  FailingComponent* lpComponent = new FailingComponent("Restarter", 2, true);
-  mSystem.add(lpComponent);
+  qntest::ScriptedComponent* lpComponent = &mSystem.addComponent(failing("Restarter", 2, true));
   mSystem.startThreads();
   while (lpComponent->mRuns.load() < 3) std::this_thread::yield();
   mSystem.makeThreadsToExit();
@@ -93,9 +74,9 @@ TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
 // ends the others, so waitForThreads returns. Before: the others ran on and the status stayed 0.
 TEST_F(ThreadFailureTest, DyingThreadFailsTheRunAndEndsTheOthers) {
   const int lBefore = gsExitRequests.load();
-  mSystem.add(new FailingComponent("Bystander", 0, false));  // started first: it can take the request
-  mSystem.add(new FailingComponent("Dying", 1, false));
-  mSystem.add(new QNCThreadPool("Pool", 1));
+  mSystem.addComponent(failing("Bystander", 0, false));  // started first: it can take the request
+  mSystem.addComponent(failing("Dying", 1, false));
+  mSystem.addPool("Pool", 1);
   mSystem.startThreads();
   EXPECT_TRUE(qntest::returnsWithin([this] { mSystem.waitForThreads(); }, std::chrono::seconds(5),
                                     [this] { mSystem.makeThreadsToExit(); }));

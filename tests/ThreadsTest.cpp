@@ -9,6 +9,7 @@
 #include <mutex>
 
 #include "LogSupport.h"
+#include "TableSystem.h"
 #include "ThreadComponent.h"
 #include "ThreadPool.h"
 
@@ -16,25 +17,7 @@ namespace {
 
 constexpr unsigned int kHour = 3600u * 1000u;
 
-// A component whose body is given by the test; it joins in its own destructor, before the body
-// (a member) is destroyed, unless told to leave that to the base destructor.
-class ScriptedComponent : public QNCThreadComponent {
- public:
-  using Body = std::function<void(ScriptedComponent&)>;
-  ScriptedComponent(Body aBody, bool aJoin = true)
-      : QNCThreadComponent("scripted"), mBody(std::move(aBody)), mJoin(aJoin) {}
-  ~ScriptedComponent() override {
-    if (mJoin) waitForExit();
-  }
-  using QNCThreadComponent::waitForExitRequest;
-
- protected:
-  void run() override { mBody(*this); }
-
- private:
-  Body mBody;
-  bool mJoin;
-};
+using qntest::ScriptedComponent;
 
 // Fault pinned for the request made first: a wait that only listens for notifications would
 // sleep the whole period instead of seeing the request already given.
@@ -93,7 +76,7 @@ TEST(ThreadComponentTest, DestructorEndsAndJoinsARunningThread) {
         }
         gsSleeperReturned = true;
       },
-      false);
+      "scripted", false);
   lpComponent->init();
   lAsleep.get_future().wait();
   delete lpComponent;
