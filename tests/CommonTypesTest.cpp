@@ -255,14 +255,9 @@ TEST(ContainerTest, EmptyListOperationsAreNotFoundAndLeaveItUsable) {
 // a node emptied after the dequeue lets the reference go.
 struct QNSSticky {
   QNSSticky() noexcept = default;
-  explicit QNSSticky(const std::shared_ptr<int>& acrValue) noexcept : mValue(acrValue) {}
-  QNSSticky(const QNSSticky&) = default;
-  QNSSticky(QNSSticky&& arOther) noexcept : mValue(arOther.mValue) {}
-  QNSSticky& operator=(const QNSSticky&) = default;
-  QNSSticky& operator=(QNSSticky&& arOther) noexcept {
-    mValue = arOther.mValue;
-    return *this;
-  }
+  explicit QNSSticky(std::shared_ptr<int> aValue) noexcept : mValue(std::move(aValue)) {}
+  QNSSticky(const QNSSticky&) noexcept = default;  // declared, so there is no move: moves copy
+  QNSSticky& operator=(const QNSSticky&) noexcept = default;
   std::shared_ptr<int> mValue;
 };
 

@@ -24,52 +24,25 @@ using qntest::idOf;
 using qntest::makeItem;
 using Element = QNCPointer<QNCQueueable>;
 
-// The operations a queue and a list share, by the system object's numbered services.
-struct Container {
-  const char* mName;
-  void (QNCSystem::*mPut)(unsigned int, const Element&);
-  Element (QNCSystem::*mTake)(unsigned int);
-  Element (QNCSystem::*mFront)(unsigned int);
-  void (QNCSystem::*mClear)(unsigned int);
-  bool (QNCSystem::*mIsEmpty)(unsigned int);
-  void (QNCSystem::*mWait)(unsigned int, unsigned int);
-  QNEWaitStatus (QNCSystem::*mTakeOrExit)(unsigned int, unsigned int, unsigned int, Element&);
-  QNEWaitStatus (QNCSystem::*mWaitOrExit)(unsigned int, unsigned int, unsigned int);
-};
-
-const Container kQueue{"Queue",
-                       &QNCSystem::enqueue,
-                       &QNCSystem::dequeue,
-                       &QNCSystem::queueFront,
-                       &QNCSystem::queueClear,
-                       &QNCSystem::isQueueEmpty,
-                       &QNCSystem::waitOnEmptyQueue,
-                       &QNCSystem::dequeueOrExit,
-                       &QNCSystem::waitOnEmptyQueueOrExit};
-const Container kList{"List",
-                      &QNCSystem::enlist,
-                      &QNCSystem::delist,
-                      &QNCSystem::listFront,
-                      &QNCSystem::listClear,
-                      &QNCSystem::isListEmpty,
-                      &QNCSystem::waitOnEmptyList,
-                      &QNCSystem::delistOrExit,
-                      &QNCSystem::waitOnEmptyListOrExit};
-
-void PrintTo(const Container& acrContainer, std::ostream* apStream) { *apStream << acrContainer.mName; }
-
-class SystemContainerTest : public ::testing::TestWithParam<Container> {
+// The operations a queue (parameter true) and a list share, by the system object's numbered
+// services.
+class SystemContainerTest : public ::testing::TestWithParam<bool> {
  protected:
-  void put(unsigned int aNumber, const Element& acrElement) {
-    (mSystem.*GetParam().mPut)(aNumber, acrElement);
+  void put(unsigned int aNo, const Element& acrElement) {
+    GetParam() ? mSystem.enqueue(aNo, acrElement) : mSystem.enlist(aNo, acrElement);
   }
-  Element take(unsigned int aNumber) { return (mSystem.*GetParam().mTake)(aNumber); }
-  bool isEmpty() { return (mSystem.*GetParam().mIsEmpty)(0); }
+  Element take(unsigned int aNo) { return GetParam() ? mSystem.dequeue(aNo) : mSystem.delist(aNo); }
+  Element front() { return GetParam() ? mSystem.queueFront(0) : mSystem.listFront(0); }
+  void clear() { GetParam() ? mSystem.queueClear(0) : mSystem.listClear(0); }
+  bool isEmpty() { return GetParam() ? mSystem.isQueueEmpty(0) : mSystem.isListEmpty(0); }
+  void waitOnEmpty() { GetParam() ? mSystem.waitOnEmptyQueue(0, 0) : mSystem.waitOnEmptyList(0, 0); }
   QNEWaitStatus takeOrExit(unsigned int aMaxWaitMs, Element& arElement) {
-    return (mSystem.*GetParam().mTakeOrExit)(0, 0, aMaxWaitMs, arElement);
+    return GetParam() ? mSystem.dequeueOrExit(0, 0, aMaxWaitMs, arElement)
+                      : mSystem.delistOrExit(0, 0, aMaxWaitMs, arElement);
   }
   QNEWaitStatus waitOrExit(unsigned int aMaxWaitMs) {
-    return (mSystem.*GetParam().mWaitOrExit)(0, 0, aMaxWaitMs);
+    return GetParam() ? mSystem.waitOnEmptyQueueOrExit(0, 0, aMaxWaitMs)
+                      : mSystem.waitOnEmptyListOrExit(0, 0, aMaxWaitMs);
   }
   // Runs takeOrExit without a limit on another thread while acrAction runs here; the take must
   // end within 1 s of the action.
@@ -91,7 +64,7 @@ class SystemContainerTest : public ::testing::TestWithParam<Container> {
 // would otherwise block for ever); the front stays in place; a take hands its reference over and
 // a clear releases each of the container's own once.
 TEST_P(SystemContainerTest, OrderEmptyTakesAndReleasedReferences) {
-  const std::function<void()> lTakesFromEmpty[] = {[&] { take(0); }, [&] { (mSystem.*GetParam().mFront)(0); },
+  const std::function<void()> lTakesFromEmpty[] = {[&] { take(0); }, [&] { front(); },
                                                    [&] { mSystem.delistBack(0); }};
   for (const auto& lrTake : lTakesFromEmpty) {
     EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lrTake, true));
@@ -101,7 +74,7 @@ TEST_P(SystemContainerTest, OrderEmptyTakesAndReleasedReferences) {
   std::atomic<int> lDestroyed{0};
   for (int lId = 1; lId <= 3; ++lId) put(0, makeItem(lId, &lDestroyed));
   put(1, makeItem(5));
-  EXPECT_EQ(1, idOf((mSystem.*GetParam().mFront)(0)));
+  EXPECT_EQ(1, idOf(front()));
   Element lTaken = take(0);
   EXPECT_EQ(1, idOf(lTaken));
   EXPECT_EQ(2, idOf(take(0)));
@@ -110,7 +83,7 @@ TEST_P(SystemContainerTest, OrderEmptyTakesAndReleasedReferences) {
   put(0, makeItem(6, &lDestroyed));
   EXPECT_EQ(3, idOf(take(0)));
   EXPECT_EQ(2, lDestroyed.load());  // 2 and 3, taken and dropped
-  (mSystem.*GetParam().mClear)(0);
+  clear();
   EXPECT_TRUE(isEmpty());
   EXPECT_EQ(3, lDestroyed.load());  // 6; the two this test holds survive
   lTaken.reset();
@@ -135,7 +108,7 @@ TEST_P(SystemContainerTest, ElementsAreDestroyedOutsideTheLock) {
       [&] {
         put(0, lReentering());
         put(0, makeItem(1));
-        (mSystem.*GetParam().mClear)(0);  // leaves the element the destructor put
+        clear();  // leaves the element the destructor put
         EXPECT_EQ(99, idOf(take(0)));
         put(0, lReentering());
         auto lIt = mSystem.listBegin(0);
@@ -190,9 +163,9 @@ TEST_P(ExitAwareWaitTest, ExitRequestWakesBlockedTakeAtOnce) {
   EXPECT_EQ(QNWS_Exit, takeWhile([this] { mSystem.makeThreadsToExit(); }, lElement));
 }
 
-std::string nameOf(const ::testing::TestParamInfo<Container>& acrInfo) { return acrInfo.param.mName; }
-INSTANTIATE_TEST_SUITE_P(QueueAndList, SystemContainerTest, ::testing::Values(kQueue, kList), nameOf);
-INSTANTIATE_TEST_SUITE_P(ListsAndQueues, ExitAwareWaitTest, ::testing::Values(kList, kQueue), nameOf);
+std::string nameOf(const ::testing::TestParamInfo<bool>& acrInfo) { return acrInfo.param ? "Queue" : "List"; }
+INSTANTIATE_TEST_SUITE_P(QueueAndList, SystemContainerTest, ::testing::Bool(), nameOf);
+INSTANTIATE_TEST_SUITE_P(ListsAndQueues, ExitAwareWaitTest, ::testing::Bool(), nameOf);
 
 // The list's own operations: both ends, and a walk whose listErase moves the iterator on.
 TEST(SystemListsTest, BothEndsAndAWalkThatErasesEveryOtherElement) {
@@ -308,7 +281,7 @@ TEST_P(SystemContainerTest, HandOffUnderStressDeliversEveryItemExactlyOnce) {
   getLogCode(lSavedLogCode);
   setLogCode(lSavedLogCode & ~static_cast<unsigned int>(QNLL_Trace));
   constexpr int kProducers = 4, kConsumers = 4, kPerProducer = 3000, kItems = kProducers * kPerProducer;
-  const bool lQueue = std::string(GetParam().mName) == "Queue";
+  const bool lQueue = GetParam();
   std::atomic<int> lDestroyed{0}, lConsumersDone{0};
   auto lPut = [&](int aId) {
     if (!lQueue && aId % 7 == 0) {
@@ -325,7 +298,7 @@ TEST_P(SystemContainerTest, HandOffUnderStressDeliversEveryItemExactlyOnce) {
       for (;;) {
         Element lItem;
         try {
-          (mSystem.*GetParam().mWait)(0, 0);
+          waitOnEmpty();
           lItem = !lQueue && lConsumer % 2 ? mSystem.delistBack(0) : take(0);
         } catch (const QNCNotFoundEx&) {
           continue;  // another consumer took it between the wait and the removal
