@@ -16,6 +16,7 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdlib>
@@ -56,14 +57,12 @@ void checkUnsigned(const QNCKeyValueFormatParser& acrParser, const QNCString& ac
   }
 }
 
-void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& acrMarkers, bool aFold,
-                 unsigned int aLineCount) {
-  QNCVector<QNCString> lKeys;
-  acrParser.getKeys(lKeys);
+void checkParsed(const QNCKeyValueFormatParser& acrParser, const QNCVector<QNCString>& acrKeys,
+                 const std::string& acrMarkers, bool aFold, unsigned int aLineCount) {
   std::set<std::string> lSeen;
-  const unsigned int lCount = lKeys.numberOfElements();
+  const unsigned int lCount = acrKeys.numberOfElements();
   for (unsigned int lIndex = 0; lIndex < lCount; ++lIndex) {
-    const char* lpKey = lKeys[lIndex].get();
+    const char* lpKey = acrKeys[lIndex].get();
     const size_t lLength = strlen(lpKey);
     QN_FUZZ_CHECK(lLength != 0);
     QN_FUZZ_CHECK(!isBlank(lpKey[0]) && !isBlank(lpKey[lLength - 1]));
@@ -73,14 +72,14 @@ void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& ac
     // Lookups are linear in the number of keys; a file of thousands of keys is checked at both
     // ends so one input stays fast, while the uniqueness above covers every key.
     if (lIndex >= 128 && lIndex + 128 < lCount) continue;
-    QN_FUZZ_CHECK(acrParser.hasKey(lKeys[lIndex]));
-    const char* lpValue = acrParser.getValue(lKeys[lIndex]).get();
+    QN_FUZZ_CHECK(acrParser.hasKey(acrKeys[lIndex]));
+    const char* lpValue = acrParser.getValue(acrKeys[lIndex]).get();
     const size_t lValueLength = strlen(lpValue);
     QN_FUZZ_CHECK(lValueLength == 0 || (!isBlank(lpValue[0]) && !isBlank(lpValue[lValueLength - 1])));
     QN_FUZZ_CHECK(strchr(lpValue, '\n') == nullptr);
-    const unsigned int lLine = acrParser.getLine(lKeys[lIndex]);
+    const unsigned int lLine = acrParser.getLine(acrKeys[lIndex]);
     QN_FUZZ_CHECK(lLine >= 1 && lLine <= aLineCount);
-    checkUnsigned(acrParser, lKeys[lIndex]);
+    checkUnsigned(acrParser, acrKeys[lIndex]);
   }
 }
 
@@ -102,8 +101,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   }
   QN_FUZZ_CHECK(ftruncate(sMemoryFile, 0) == 0 && lseek(sMemoryFile, 0, SEEK_SET) == 0);
   qnfuzz::writeAll(sMemoryFile, apData + lSkip, aSize - lSkip);
-  unsigned int lLineCount = 1;
-  for (size_t lIndex = lSkip; lIndex < aSize; ++lIndex) lLineCount += apData[lIndex] == '\n' ? 1 : 0;
+  const unsigned int lLineCount =
+      1 + static_cast<unsigned int>(std::count(apData + lSkip, apData + aSize, '\n'));
 
   const QNCString lPath(gPath.c_str());
   QNCKeyValueFormatParser lParser(lPath, QNCString(lSkip == 2 ? lMarkers.c_str() : ""), lFold,
@@ -123,13 +122,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   } catch (...) {
     qnfuzz::foreignException("QNCKeyValueFormatParser::parse");
   }
-  if (!lParsed) {
-    // A failed parse keeps nothing of the file.
-    QNCVector<QNCString> lKeys;
-    lParser.getKeys(lKeys);
-    QN_FUZZ_CHECK(lKeys.numberOfElements() == 0);
-    return 0;
-  }
-  checkParsed(lParser, lMarkers, lFold, lLineCount);
+  QNCVector<QNCString> lKeys;
+  lParser.getKeys(lKeys);
+  QN_FUZZ_CHECK(lParsed || lKeys.numberOfElements() == 0);  // a failed parse keeps nothing of the file
+  checkParsed(lParser, lKeys, lMarkers, lFold, lLineCount);
   return 0;
 }
