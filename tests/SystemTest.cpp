@@ -194,32 +194,24 @@ TEST_F(SettingsTest, ApplySettingsSetsTheLoggerDaemonizesOnlyForOneAndStopsAtABa
   EXPECT_THROW(lWrongKind.applySettings(), QNCInvalidEx);
 }
 
-// Each thread marks the identifiers it holds in a shared table; a second holder of the same
-// identifier finds the mark already set. The small bound makes identifiers circulate.
+// Each thread marks the identifier it holds in a shared table, then returns it; a second holder of
+// the same identifier finds the mark already set. The small bound makes identifiers circulate.
 TEST_F(SettingsTest, ConcurrentThreadsNeverHoldTheSameIdentifier) {
-  constexpr unsigned int kBound = 32;
+  constexpr unsigned int kBound = 8;
   mSystem.useIdentifierBound(kBound);
   std::vector<std::atomic<bool>> lHeld(kBound + 1);
   std::atomic<unsigned int> lFaults{0};
   std::vector<std::thread> lThreads;
   for (unsigned int lThread = 0; lThread < 4; ++lThread) {
     lThreads.emplace_back([&] {
-      std::vector<unsigned int> lMine;
-      for (unsigned int lRound = 0; lRound < 2000; ++lRound) {
+      for (unsigned int lRound = 0; lRound < 4000; ++lRound) {
         unsigned int lId = 0;
         mSystem.generateNumericId(lId);
-        if (lId == 0 || lId > kBound || lHeld[lId].exchange(true)) {
-          ++lFaults;
-          continue;
-        }
-        lMine.push_back(lId);
-        if (lMine.size() == kBound / 4) {
-          for (unsigned int lReturned : lMine) {
-            lHeld[lReturned].store(false);
-            mSystem.returnNumericId(lReturned);
-          }
-          lMine.clear();
-        }
+        ASSERT_TRUE(lId != 0 && lId <= kBound);
+        lFaults += lHeld[lId].exchange(true);
+        std::this_thread::yield();
+        lHeld[lId].store(false);
+        mSystem.returnNumericId(lId);
       }
     });
   }
