@@ -1,6 +1,6 @@
 // The system object's numbered services: synchronised queues and lists (one set of cases run on
-// both), waits on the numbered conditionals, a stress run of many producers and consumers, and
-// the assertions on every number.
+// both, the exit-aware waits among them), waits on the numbered conditionals, a stress run of
+// many producers and consumers, and the one table of assertions (numbers, pointers, buffers).
 
 #include <gtest/gtest.h>
 

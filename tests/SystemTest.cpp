@@ -1,4 +1,4 @@
-// The system object within one process: the driver's free functions (log path, registration),
+// The system object within one process: the driver's free functions (the log path),
 // starting and stopping the threads, the settings and the common command-line options.
 
 #include <gtest/gtest.h>

@@ -10,13 +10,10 @@
 #include <string>
 #include <vector>
 
-#include "DeathTestSupport.h"
 #include "LogSupport.h"
 #include "RunStatus.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
-#include "ThreadComponent.h"
-#include "ThreadPool.h"
 
 namespace {
 
