@@ -13,8 +13,10 @@
 //   account for every word of the line exactly once;
 // - a second run() over the same line ends the same way.
 
+#include <algorithm>
 #include <cstdint>
 #include <cstring>
+#include <iterator>
 #include <string>
 #include <vector>
 
@@ -34,31 +36,18 @@ const QNSCommandLineArgumentDesc kOptions[] = {
 // The words of the line as the parser's contract defines them: runs of spaces and tabs separate.
 std::vector<std::string> words(const std::string& acrLine) {
   std::vector<std::string> lWords;
-  std::string lWord;
-  for (const char lChar : acrLine) {
-    if (lChar == ' ' || lChar == '\t') {
-      if (!lWord.empty()) lWords.push_back(lWord);
-      lWord.clear();
-    } else {
-      lWord += lChar;
-    }
+  for (size_t lAt = acrLine.find_first_not_of(" \t"); lAt != std::string::npos;
+       lAt = acrLine.find_first_not_of(" \t", lAt)) {
+    const size_t lEnd = acrLine.find_first_of(" \t", lAt);
+    lWords.push_back(acrLine.substr(lAt, lEnd - lAt));
+    lAt = lEnd;
   }
-  if (!lWord.empty()) lWords.push_back(lWord);
   return lWords;
 }
 
 bool isOption(const std::string& acrWord) {
-  for (const QNSCommandLineArgumentDesc& lrDesc : kOptions) {
-    if (acrWord == lrDesc.mOption) return true;
-  }
-  return false;
-}
-
-bool isDocumentedRejection(const char* apMessage) {
-  for (const char* lpForm : {"Unknown option '", "Option '", "Unexpected argument '"}) {
-    if (strncmp(apMessage, lpForm, strlen(lpForm)) == 0) return true;
-  }
-  return false;
+  return std::any_of(std::begin(kOptions), std::end(kOptions),
+                     [&](const QNSCommandLineArgumentDesc& acrDesc) { return acrWord == acrDesc.mOption; });
 }
 
 // Outcome of one run(): true when it succeeded.
@@ -68,7 +57,9 @@ bool runOnce(QNCCommandLineParser& arParser) {
     QN_FUZZ_CHECK(arParser.getState() == QNCLPS_Parsed);
     return true;
   } catch (const QNCInvalidEx& acrException) {
-    QN_FUZZ_CHECK(isDocumentedRejection(acrException.what()));
+    const std::string lMessage = acrException.what();
+    QN_FUZZ_CHECK(lMessage.rfind("Unknown option '", 0) == 0 || lMessage.rfind("Option '", 0) == 0 ||
+                  lMessage.rfind("Unexpected argument '", 0) == 0);
   } catch (const QNCException&) {
     // Another member of the family (no memory): a clear error as well.
   } catch (...) {
@@ -76,19 +67,6 @@ bool runOnce(QNCCommandLineParser& arParser) {
   }
   QN_FUZZ_CHECK(arParser.getState() == QNCLPS_Failed);
   return false;
-}
-
-void checkNothingKept(QNCCommandLineParser& arParser) {
-  for (const QNSCommandLineArgumentDesc& lrDesc : kOptions) {
-    QNCPointer<QNCCommandLineArgument> lArgument;
-    bool lFound = true;
-    try {
-      arParser.getArgument(lrDesc.mOption, lArgument);
-    } catch (const QNCNotFoundEx&) {
-      lFound = false;
-    }
-    QN_FUZZ_CHECK(!lFound);
-  }
 }
 
 void checkParsed(QNCCommandLineParser& arParser, const std::vector<std::string>& acrWords) {
@@ -131,11 +109,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   lParser.setArgumentDesc(lTable);
   lParser.setCommandLine(QNCString(lLine.c_str()));
   const bool lParsed = runOnce(lParser);
-  if (lParsed) {
-    checkParsed(lParser, words(lLine));
-  } else {
-    checkNothingKept(lParser);
-  }
+  // A failed run keeps no argument: against no words, any option found breaks a property.
+  checkParsed(lParser, lParsed ? words(lLine) : std::vector<std::string>());
   QN_FUZZ_CHECK(runOnce(lParser) == lParsed);
   return 0;
 }

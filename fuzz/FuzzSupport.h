@@ -34,14 +34,10 @@ namespace qnfuzz {
   abort();
 }
 
-// Writes every byte (the descriptor never stays full: a pipe below its capacity, a memory file).
+// Writes every byte in one call: the descriptor never holds back part of it (a memory file, or a
+// pipe below its capacity), and no signal arrives in a fuzz run.
 inline void writeAll(int aFd, const uint8_t* apData, size_t aSize) {
-  for (size_t lDone = 0; lDone < aSize;) {
-    const ssize_t lWritten = write(aFd, apData + lDone, aSize - lDone);
-    if (lWritten < 0 && errno == EINTR) continue;  // nothing was written; the same write is safe again
-    QN_FUZZ_CHECK(lWritten > 0);
-    lDone += static_cast<size_t>(lWritten);
-  }
+  QN_FUZZ_CHECK(write(aFd, apData, aSize) == static_cast<ssize_t>(aSize));
 }
 
 // An independent reading of apText as an optional '-' (when aSigned) and decimal digits, judged

@@ -16,6 +16,7 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdlib>
@@ -30,29 +31,18 @@
 
 namespace {
 
-int gMemoryFile = -1;
-std::string gPath;
-
-// Replaces the memory file's contents with the input's.
-void store(const uint8_t* apData, size_t aSize) {
-  QN_FUZZ_CHECK(ftruncate(gMemoryFile, 0) == 0 && lseek(gMemoryFile, 0, SEEK_SET) == 0);
-  qnfuzz::writeAll(gMemoryFile, apData, aSize);
-}
+std::string gPath;  // the memory file's /proc/self/fd path, made on the first input
 
 std::string folded(const char* apText, bool aFold) {
   std::string lText(apText);
-  if (aFold) {
-    for (char& lrChar : lText) {
-      if (lrChar >= 'A' && lrChar <= 'Z') lrChar = static_cast<char>(lrChar - 'A' + 'a');
-    }
-  }
+  for (char& lrChar : lText) lrChar = aFold && lrChar >= 'A' && lrChar <= 'Z' ? lrChar - 'A' + 'a' : lrChar;
   return lText;
 }
 
 bool isBlank(char aChar) { return aChar == ' ' || aChar == '\t' || aChar == '\r'; }
 
-bool startsWith(const char* apText, const std::string& acrPrefix) {
-  return strncmp(apText, acrPrefix.c_str(), acrPrefix.size()) == 0;
+bool startsWithPath(const char* apText) {
+  return strncmp(apText, (gPath + ":").c_str(), gPath.size() + 1) == 0;
 }
 
 // getUnsigned() agrees with an independent reading of the value as a decimal unsigned int.
@@ -67,14 +57,12 @@ void checkUnsigned(const QNCKeyValueFormatParser& acrParser, const QNCString& ac
   }
 }
 
-void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& acrMarkers, bool aFold,
-                 unsigned int aLineCount) {
-  QNCVector<QNCString> lKeys;
-  acrParser.getKeys(lKeys);
+void checkParsed(const QNCKeyValueFormatParser& acrParser, const QNCVector<QNCString>& acrKeys,
+                 const std::string& acrMarkers, bool aFold, unsigned int aLineCount) {
   std::set<std::string> lSeen;
-  const unsigned int lCount = lKeys.numberOfElements();
+  const unsigned int lCount = acrKeys.numberOfElements();
   for (unsigned int lIndex = 0; lIndex < lCount; ++lIndex) {
-    const char* lpKey = lKeys[lIndex].get();
+    const char* lpKey = acrKeys[lIndex].get();
     const size_t lLength = strlen(lpKey);
     QN_FUZZ_CHECK(lLength != 0);
     QN_FUZZ_CHECK(!isBlank(lpKey[0]) && !isBlank(lpKey[lLength - 1]));
@@ -84,30 +72,24 @@ void checkParsed(const QNCKeyValueFormatParser& acrParser, const std::string& ac
     // Lookups are linear in the number of keys; a file of thousands of keys is checked at both
     // ends so one input stays fast, while the uniqueness above covers every key.
     if (lIndex >= 128 && lIndex + 128 < lCount) continue;
-    QN_FUZZ_CHECK(acrParser.hasKey(lKeys[lIndex]));
-    const char* lpValue = acrParser.getValue(lKeys[lIndex]).get();
+    QN_FUZZ_CHECK(acrParser.hasKey(acrKeys[lIndex]));
+    const char* lpValue = acrParser.getValue(acrKeys[lIndex]).get();
     const size_t lValueLength = strlen(lpValue);
     QN_FUZZ_CHECK(lValueLength == 0 || (!isBlank(lpValue[0]) && !isBlank(lpValue[lValueLength - 1])));
     QN_FUZZ_CHECK(strchr(lpValue, '\n') == nullptr);
-    const unsigned int lLine = acrParser.getLine(lKeys[lIndex]);
+    const unsigned int lLine = acrParser.getLine(acrKeys[lIndex]);
     QN_FUZZ_CHECK(lLine >= 1 && lLine <= aLineCount);
-    checkUnsigned(acrParser, lKeys[lIndex]);
+    checkUnsigned(acrParser, acrKeys[lIndex]);
   }
 }
 
 }  // namespace
 
-// The memory file is made once, on the first input.
-void openMemoryFile() {
-  if (gMemoryFile >= 0) return;
-  gMemoryFile = memfd_create("qnfuzz-config", MFD_CLOEXEC);
-  QN_FUZZ_CHECK(gMemoryFile >= 0);
-  gPath = "/proc/self/fd/" + std::to_string(gMemoryFile);
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
+  static const int sMemoryFile = memfd_create("qnfuzz-config", MFD_CLOEXEC);
+  QN_FUZZ_CHECK(sMemoryFile >= 0);
   if (aSize == 0) return 0;
-  openMemoryFile();
+  gPath = "/proc/self/fd/" + std::to_string(sMemoryFile);
   const uint8_t lFlags = apData[0];
   const bool lFold = (lFlags & 1) != 0;
   const bool lAllowDuplicates = (lFlags & 2) != 0;
@@ -117,9 +99,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
     lSkip = 2;
     if (apData[1] != 0) lMarkers = std::string(1, static_cast<char>(apData[1]));
   }
-  store(apData + lSkip, aSize - lSkip);
-  unsigned int lLineCount = 1;
-  for (size_t lIndex = lSkip; lIndex < aSize; ++lIndex) lLineCount += apData[lIndex] == '\n' ? 1 : 0;
+  QN_FUZZ_CHECK(ftruncate(sMemoryFile, 0) == 0 && lseek(sMemoryFile, 0, SEEK_SET) == 0);
+  qnfuzz::writeAll(sMemoryFile, apData + lSkip, aSize - lSkip);
+  const unsigned int lLineCount =
+      1 + static_cast<unsigned int>(std::count(apData + lSkip, apData + aSize, '\n'));
 
   const QNCString lPath(gPath.c_str());
   QNCKeyValueFormatParser lParser(lPath, QNCString(lSkip == 2 ? lMarkers.c_str() : ""), lFold,
@@ -129,23 +112,19 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
     lParser.parse();
     lParsed = true;
   } catch (const QNCInvalidEx& acrException) {
-    QN_FUZZ_CHECK(startsWith(acrException.what(), gPath + ":"));
+    QN_FUZZ_CHECK(startsWithPath(acrException.what()));
     QN_FUZZ_CHECK(strstr(acrException.what(), "expected 'key = value'") != nullptr);
   } catch (const QNCExistsEx& acrException) {
     QN_FUZZ_CHECK(!lAllowDuplicates);
-    QN_FUZZ_CHECK(startsWith(acrException.what(), gPath + ":"));
+    QN_FUZZ_CHECK(startsWithPath(acrException.what()));
   } catch (const QNCException&) {
     // Another member of the family (no memory, an unreadable file): a clear error as well.
   } catch (...) {
     qnfuzz::foreignException("QNCKeyValueFormatParser::parse");
   }
-  if (!lParsed) {
-    // A failed parse keeps nothing of the file.
-    QNCVector<QNCString> lKeys;
-    lParser.getKeys(lKeys);
-    QN_FUZZ_CHECK(lKeys.numberOfElements() == 0);
-    return 0;
-  }
-  checkParsed(lParser, lMarkers, lFold, lLineCount);
+  QNCVector<QNCString> lKeys;
+  lParser.getKeys(lKeys);
+  QN_FUZZ_CHECK(lParsed || lKeys.numberOfElements() == 0);  // a failed parse keeps nothing of the file
+  checkParsed(lParser, lKeys, lMarkers, lFold, lLineCount);
   return 0;
 }

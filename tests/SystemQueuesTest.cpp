@@ -1,16 +1,20 @@
 // The system object's numbered services: synchronised queues and lists (one set of cases run on
-// both), waits on the numbered conditionals, a stress run of many producers and consumers, and
-// the assertions on every number.
+// both, the exit-aware waits among them), waits on the numbered conditionals, a stress run of
+// many producers and consumers, and the one table of assertions (numbers, pointers, buffers).
 
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <chrono>
 #include <functional>
 #include <thread>
 #include <vector>
 
+#include "AllocatedBuffer.h"
+#include "BufferManager.h"
 #include "DeathTestSupport.h"
 #include "Logger.h"
+#include "SystemGlobals.h"
 #include "TableSystem.h"
 
 namespace {
@@ -20,76 +24,71 @@ using qntest::idOf;
 using qntest::makeItem;
 using Element = QNCPointer<QNCQueueable>;
 
-// The operations a queue and a list share, by the system object's numbered services.
-struct Container {
-  const char* mName;
-  std::function<void(QNCSystem&, unsigned int, const Element&)> mPut;
-  std::function<Element(QNCSystem&, unsigned int)> mTake, mFront;
-  std::function<void(QNCSystem&, unsigned int)> mClear;
-  std::function<bool(QNCSystem&, unsigned int)> mIsEmpty;
-};
-
-const Container kQueue{"Queue",
-                       [](QNCSystem& arS, unsigned int aN, const Element& acrE) { arS.enqueue(aN, acrE); },
-                       [](QNCSystem& arS, unsigned int aN) { return arS.dequeue(aN); },
-                       [](QNCSystem& arS, unsigned int aN) { return arS.queueFront(aN); },
-                       [](QNCSystem& arS, unsigned int aN) { arS.queueClear(aN); },
-                       [](QNCSystem& arS, unsigned int aN) { return arS.isQueueEmpty(aN); }};
-const Container kList{"List",
-                      [](QNCSystem& arS, unsigned int aN, const Element& acrE) { arS.enlist(aN, acrE); },
-                      [](QNCSystem& arS, unsigned int aN) { return arS.delist(aN); },
-                      [](QNCSystem& arS, unsigned int aN) { return arS.listFront(aN); },
-                      [](QNCSystem& arS, unsigned int aN) { arS.listClear(aN); },
-                      [](QNCSystem& arS, unsigned int aN) { return arS.isListEmpty(aN); }};
-
-void PrintTo(const Container& acrContainer, std::ostream* apStream) { *apStream << acrContainer.mName; }
-
-class SystemContainerTest : public ::testing::TestWithParam<Container> {
+// The operations a queue (parameter true) and a list share, by the system object's numbered
+// services.
+class SystemContainerTest : public ::testing::TestWithParam<bool> {
  protected:
-  void put(unsigned int aNumber, const Element& acrElement) { GetParam().mPut(mSystem, aNumber, acrElement); }
-  Element take(unsigned int aNumber) { return GetParam().mTake(mSystem, aNumber); }
+  void put(unsigned int aNo, const Element& acrElement) {
+    GetParam() ? mSystem.enqueue(aNo, acrElement) : mSystem.enlist(aNo, acrElement);
+  }
+  Element take(unsigned int aNo) { return GetParam() ? mSystem.dequeue(aNo) : mSystem.delist(aNo); }
+  Element front() { return GetParam() ? mSystem.queueFront(0) : mSystem.listFront(0); }
+  void clear() { GetParam() ? mSystem.queueClear(0) : mSystem.listClear(0); }
+  bool isEmpty() { return GetParam() ? mSystem.isQueueEmpty(0) : mSystem.isListEmpty(0); }
+  void waitOnEmpty() { GetParam() ? mSystem.waitOnEmptyQueue(0, 0) : mSystem.waitOnEmptyList(0, 0); }
+  QNEWaitStatus takeOrExit(unsigned int aMaxWaitMs, Element& arElement) {
+    return GetParam() ? mSystem.dequeueOrExit(0, 0, aMaxWaitMs, arElement)
+                      : mSystem.delistOrExit(0, 0, aMaxWaitMs, arElement);
+  }
+  QNEWaitStatus waitOrExit(unsigned int aMaxWaitMs) {
+    return GetParam() ? mSystem.waitOnEmptyQueueOrExit(0, 0, aMaxWaitMs)
+                      : mSystem.waitOnEmptyListOrExit(0, 0, aMaxWaitMs);
+  }
+  // Runs takeOrExit without a limit on another thread while acrAction runs here; the take must
+  // end within 1 s of the action.
+  QNEWaitStatus takeWhile(const std::function<void()>& acrAction, Element& arElement) {
+    QNEWaitStatus lStatus = QNWS_TimedOut;
+    std::thread lTaker([&] { lStatus = takeOrExit(0, arElement); });
+    std::this_thread::sleep_for(50ms);  // let it block
+    const auto lStart = std::chrono::steady_clock::now();
+    acrAction();
+    lTaker.join();
+    EXPECT_LT(std::chrono::steady_clock::now() - lStart, 1s);
+    return lStatus;
+  }
 
   qntest::TableSystem mSystem{1, 2, 2};
 };
 
-TEST_P(SystemContainerTest, ElementsLeaveTheirOwnContainerInTheOrderTheyCame) {
-  for (int lId = 1; lId <= 3; ++lId) put(0, makeItem(lId));
-  put(1, makeItem(5));
-  EXPECT_EQ(1, idOf(GetParam().mFront(mSystem, 0)));
-  EXPECT_EQ(1, idOf(take(0)));  // the front was left in place
-  EXPECT_EQ(2, idOf(take(0)));
-  put(0, makeItem(4));
-  EXPECT_EQ(3, idOf(take(0)));
-  EXPECT_EQ(4, idOf(take(0)));
-  EXPECT_TRUE(GetParam().mIsEmpty(mSystem, 0));
-  EXPECT_EQ(5, idOf(take(1)));
-}
-
-// Each removal from an empty container must release its lock on the way out: the put that
-// follows would otherwise block for ever.
-TEST_P(SystemContainerTest, TakingFromAnEmptyOneThrowsNotFoundAndLeavesItUsable) {
-  const std::vector<std::function<void()>> lTakes = {[&] { take(0); }, [&] { GetParam().mFront(mSystem, 0); },
-                                                     [&] { mSystem.delistBack(0); }};
-  for (int lRound = 0; lRound < 3; ++lRound) {
-    EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lTakes[lRound], true)) << lRound;
-    ASSERT_TRUE(qntest::returnsWithin([&] { put(0, makeItem(lRound)); }, 10s));
-    EXPECT_EQ(lRound, idOf(take(0)));
+// Each removal from an empty container releases its lock on the way out (the put that follows
+// would otherwise block for ever); the front stays in place; a take hands its reference over and
+// a clear releases each of the container's own once.
+TEST_P(SystemContainerTest, OrderEmptyTakesAndReleasedReferences) {
+  const std::function<void()> lTakesFromEmpty[] = {[&] { take(0); }, [&] { front(); },
+                                                   [&] { mSystem.delistBack(0); }};
+  for (const auto& lrTake : lTakesFromEmpty) {
+    EXPECT_EQ("Not Found (code 8)", qntest::thrown<QNCNotFoundEx>(lrTake, true));
+    ASSERT_TRUE(qntest::returnsWithin([&] { put(0, makeItem(0)); }, 10s));
+    EXPECT_EQ(0, idOf(take(0)));
   }
-}
-
-TEST_P(SystemContainerTest, TakeHandsOverAndClearReleasesEachReferenceOnce) {
   std::atomic<int> lDestroyed{0};
-  const Element lKept = makeItem(3, &lDestroyed);
-  put(0, makeItem(1, &lDestroyed));
-  put(0, makeItem(2, &lDestroyed));
-  put(0, lKept);
+  for (int lId = 1; lId <= 3; ++lId) put(0, makeItem(lId, &lDestroyed));
+  put(1, makeItem(5));
+  EXPECT_EQ(1, idOf(front()));
   Element lTaken = take(0);
-  GetParam().mClear(mSystem, 0);
-  EXPECT_TRUE(GetParam().mIsEmpty(mSystem, 0));
-  EXPECT_EQ(1, lDestroyed.load());  // the two still held by this test survive
   EXPECT_EQ(1, idOf(lTaken));
+  EXPECT_EQ(2, idOf(take(0)));
+  const Element lKept = makeItem(4, &lDestroyed);
+  put(0, lKept);
+  put(0, makeItem(6, &lDestroyed));
+  EXPECT_EQ(3, idOf(take(0)));
+  EXPECT_EQ(2, lDestroyed.load());  // 2 and 3, taken and dropped
+  clear();
+  EXPECT_TRUE(isEmpty());
+  EXPECT_EQ(3, lDestroyed.load());  // 6; the two this test holds survive
   lTaken.reset();
-  EXPECT_EQ(2, lDestroyed.load());
+  EXPECT_EQ(4, lDestroyed.load());
+  EXPECT_EQ(5, idOf(take(1)));
 }
 
 // An element whose destructor uses the container it leaves: removing it must not hold the lock
@@ -109,7 +108,7 @@ TEST_P(SystemContainerTest, ElementsAreDestroyedOutsideTheLock) {
       [&] {
         put(0, lReentering());
         put(0, makeItem(1));
-        GetParam().mClear(mSystem, 0);  // leaves the element the destructor put
+        clear();  // leaves the element the destructor put
         EXPECT_EQ(99, idOf(take(0)));
         put(0, lReentering());
         auto lIt = mSystem.listBegin(0);
@@ -123,10 +122,50 @@ TEST_P(SystemContainerTest, ElementsAreDestroyedOutsideTheLock) {
       10s));
 }
 
-INSTANTIATE_TEST_SUITE_P(QueueAndList, SystemContainerTest, ::testing::Values(kQueue, kList),
-                         [](const ::testing::TestParamInfo<Container>& acrInfo) {
-                           return acrInfo.param.mName;
-                         });
+// --- The exit-aware waits: each ends with the element, the exit request or the time limit, says
+// which, and is woken at once by the producer's signal or by makeThreadsToExit.
+class ExitAwareWaitTest : public SystemContainerTest {};
+
+TEST_P(ExitAwareWaitTest, EndsWithElementTimeOutOrExitAndSaysWhich) {
+  Element lElement;
+  const auto lStart = std::chrono::steady_clock::now();
+  EXPECT_EQ(QNWS_TimedOut, takeOrExit(60, lElement));  // empty: the time limit ends it, not earlier
+  EXPECT_GE(std::chrono::steady_clock::now() - lStart, 60ms);
+  EXPECT_TRUE(lElement.isNull());
+  EXPECT_EQ(QNWS_TimedOut, waitOrExit(10));
+  // A blocked take is woken by the producer's hand-over and signal, and removes the element.
+  EXPECT_EQ(QNWS_Ready, takeWhile(
+                            [this] {
+                              put(0, makeItem(7));
+                              mSystem.signal(0);
+                            },
+                            lElement));
+  EXPECT_EQ(7, idOf(lElement));
+  EXPECT_EQ(QNWS_TimedOut, takeOrExit(1, lElement));  // it was removed
+  // Elements handed over before the exit request are still taken (in order); then Exit.
+  put(0, makeItem(8));
+  EXPECT_EQ(QNWS_Ready, waitOrExit(0));
+  put(0, makeItem(9));
+  mSystem.makeThreadsToExit();
+  for (int lId : {8, 9}) {
+    EXPECT_EQ(QNWS_Ready, takeOrExit(0, lElement));
+    EXPECT_EQ(lId, idOf(lElement));
+  }
+  EXPECT_EQ(QNWS_Exit, takeOrExit(0, lElement));
+  EXPECT_TRUE(lElement.isNull());
+  EXPECT_EQ(QNWS_Exit, waitOrExit(0));
+}
+
+// A take blocked without a time limit ends at once on the exit request: makeThreadsToExit wakes
+// the conditional. Before, only a time-out let a waiter see the exit flag.
+TEST_P(ExitAwareWaitTest, ExitRequestWakesBlockedTakeAtOnce) {
+  Element lElement;
+  EXPECT_EQ(QNWS_Exit, takeWhile([this] { mSystem.makeThreadsToExit(); }, lElement));
+}
+
+std::string nameOf(const ::testing::TestParamInfo<bool>& acrInfo) { return acrInfo.param ? "Queue" : "List"; }
+INSTANTIATE_TEST_SUITE_P(QueueAndList, SystemContainerTest, ::testing::Bool(), nameOf);
+INSTANTIATE_TEST_SUITE_P(ListsAndQueues, ExitAwareWaitTest, ::testing::Bool(), nameOf);
 
 // The list's own operations: both ends, and a walk whose listErase moves the iterator on.
 TEST(SystemListsTest, BothEndsAndAWalkThatErasesEveryOtherElement) {
@@ -182,25 +221,22 @@ class SystemWaitTest : public ::testing::Test {
 TEST_F(SystemWaitTest, WaitsReturnOnlyAfterASignalOnTheirOwnConditional) {
   mSystem.signal(0);
   EXPECT_THROW(mSystem.timedWait(0, 30), QNCTimeOutEx);
-  const std::function<void()> lWaits[] = {[&] { mSystem.wait(0); }, [&] { mSystem.timedWait(0, 20000); }};
-  for (const auto& lWait : lWaits) {
-    std::atomic<bool> lReturned{false};
-    std::thread lWaiter([&] {
-      EXPECT_NO_THROW(lWait());
-      lReturned = true;
-    });
-    for (int lRound = 0; lRound < 10; ++lRound) {
-      mSystem.signal(1);
-      std::this_thread::sleep_for(5ms);
-    }
-    EXPECT_FALSE(lReturned.load());
-    // The waiter may not be inside its wait yet when the first signal comes (that one is lost).
-    EXPECT_TRUE(qntest::eventually([&] {
-      mSystem.signal(0);
-      return lReturned.load();
-    }));
-    lWaiter.join();
+  std::atomic<bool> lReturned{false};
+  std::thread lWaiter([&] {
+    EXPECT_NO_THROW(mSystem.wait(0));
+    lReturned = true;
+  });
+  for (int lRound = 0; lRound < 10; ++lRound) {
+    mSystem.signal(1);
+    std::this_thread::sleep_for(5ms);
   }
+  EXPECT_FALSE(lReturned.load());
+  // The waiter may not be inside its wait yet when the first signal comes (that one is lost).
+  EXPECT_TRUE(qntest::eventually([&] {
+    mSystem.signal(0);
+    return lReturned.load();
+  }));
+  lWaiter.join();
 }
 
 // Regression: a signal given without the conditional's lock between the waiter's emptiness test
@@ -245,7 +281,7 @@ TEST_P(SystemContainerTest, HandOffUnderStressDeliversEveryItemExactlyOnce) {
   getLogCode(lSavedLogCode);
   setLogCode(lSavedLogCode & ~static_cast<unsigned int>(QNLL_Trace));
   constexpr int kProducers = 4, kConsumers = 4, kPerProducer = 3000, kItems = kProducers * kPerProducer;
-  const bool lQueue = std::string(GetParam().mName) == "Queue";
+  const bool lQueue = GetParam();
   std::atomic<int> lDestroyed{0}, lConsumersDone{0};
   auto lPut = [&](int aId) {
     if (!lQueue && aId % 7 == 0) {
@@ -262,11 +298,7 @@ TEST_P(SystemContainerTest, HandOffUnderStressDeliversEveryItemExactlyOnce) {
       for (;;) {
         Element lItem;
         try {
-          if (lQueue) {
-            mSystem.waitOnEmptyQueue(0, 0);
-          } else {
-            mSystem.waitOnEmptyList(0, 0);
-          }
+          waitOnEmpty();
           lItem = !lQueue && lConsumer % 2 ? mSystem.delistBack(0) : take(0);
         } catch (const QNCNotFoundEx&) {
           continue;  // another consumer took it between the wait and the removal
@@ -295,13 +327,16 @@ TEST_P(SystemContainerTest, HandOffUnderStressDeliversEveryItemExactlyOnce) {
   for (const auto& lArrival : lArrivals) lWrong += lArrival.load() != 1;
   EXPECT_EQ(0, lWrong) << "items lost or delivered twice";
   EXPECT_EQ(kItems + kConsumers, lDestroyed.load());
-  EXPECT_TRUE(GetParam().mIsEmpty(mSystem, 0));
+  EXPECT_TRUE(isEmpty());
   setLogCode(lSavedLogCode);
 }
 
-// A number out of range ends the process with exactly one "-H-" line naming the assertion, and
-// exit status 1: one representative service per table.
-TEST(SystemNumbersDeathTest, NumberOutOfRangeIsAnAssertion) {
+// Misuse is a programming error: the process ends with exactly one "-H-" line naming the broken
+// condition and exit status 1, rather than crash or go on with a null object. One representative
+// per table of the system object and per value type.
+const QNCPointer<int> gsEmpty;
+
+TEST(MisuseDeathTest, EveryBrokenConditionIsAnAssertion) {
   qntest::TableSystem lSystem(2, 2, 2);
   QNCPointer<QNCBuffer> lBuffer;
   unsigned int lCount = 0;
@@ -316,6 +351,19 @@ TEST(SystemNumbersDeathTest, NumberOutOfRangeIsAnAssertion) {
       {[&] { lSystem.send(0, lBuffer, lCount); }, "acWriterNo < this->mWriters.numberOfElements()"},
       // A bad reader number is reported before a missing wait time.
       {[&] { lSystem.waitForActivity(0, 0); }, "acReaderNo < this->mReaders.numberOfElements()"},
+      {[] { setSystemObject(nullptr); }, "0UL != apSystem"},
+      {[] { QNCPointer<int> lCopy(gsEmpty); }, "0 != acrCopy.mPointer"},
+      {[] { (void)*gsEmpty; }, "0 != mPointer"},
+      {[] { (void)QNCPointer<QNCString>(new QNCString[2], QNPST_Array, QNPAT_New)->get(); },
+       "QNPST_Individual == mSizeType"},
+      {[] { QNCString lText(static_cast<const char*>(nullptr)); }, "0 != apString"},
+      {[] { QNCAllocatedBuffer lEmpty(0, 64); }, "acUseLength != 0"},
+      {[] { QNCAllocatedBuffer lOver(65, 64); }, "acMaxLength == 0 || acUseLength <= acMaxLength"},
+      {[] {
+         qntest::TableSystem lNoBuckets;
+         QNCBufferManager lManager(&lNoBuckets);
+       },
+       "lBufferList.size() > 0"},
   };
   for (const auto& lrCase : lCases)
     EXPECT_EXIT(lrCase.mCall(), ::testing::ExitedWithCode(1), qntest::assertionFailure(lrCase.mCondition));

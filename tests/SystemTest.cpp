@@ -1,29 +1,22 @@
-// The system object within one process: the driver's free functions (log path, registration),
+// The system object within one process: the driver's free functions (the log path),
 // starting and stopping the threads, the settings and the common command-line options.
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <cstdlib>
 #include <thread>
 
-#include "DeathTestSupport.h"
-#include "IpAddress.h"
 #include "LogSupport.h"
 #include "MultiType.h"
 #include "Mutex.h"
 #include "NumericIdManager.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
-#include "ThreadComponent.h"
-#include "ThreadPool.h"
-#include "Version.h"
 
 namespace {
 
 using qntest::expectInOrder;
-using qntest::levelOf;
 
 // The log path setLogFilePath composes with QN_LOG_DIR set to apDir (unset when null), and the
 // log directory then reported. The directory is read from the environment each time.
@@ -49,63 +42,16 @@ TEST(DriverTest, LogPathIsTheVariableOrTmpAndTheNameCutTo511Characters) {
   unsetenv("QN_LOG_DIR");
 }
 
-// Run in a child process: the registration must not outlive the test.
-bool gsFirstDeleted = false;
-struct FirstSystem : qntest::TableSystem {
-  ~FirstSystem() override { gsFirstDeleted = true; }
-};
-
-TEST(DriverTest, SecondRegistrationReplacesTheFirstWithoutDeletingIt) {
-  EXPECT_EXIT(
-      {
-        static FirstSystem* spFirst = new FirstSystem;  // kept reachable for the leak checker
-        setSystemObject(spFirst);
-        auto* lpSecond = new qntest::TableSystem;
-        setSystemObject(lpSecond);
-        QNCSystem* lpSeen = nullptr;
-        getSystemObject(lpSeen);
-        exit(lpSeen == lpSecond && !gsFirstDeleted ? 0 : 2);
-      },
-      ::testing::ExitedWithCode(0), "");
-}
-
-TEST(DriverDeathTest, RegisteringNullOrRunningWithoutAnObjectIsAnAssertion) {
-  char lName[] = "driver";
-  char* lArgv[] = {lName, nullptr};
-  EXPECT_EXIT(setSystemObject(nullptr), ::testing::ExitedWithCode(1),
-              qntest::assertionFailure("0UL != apSystem"));
-  EXPECT_EXIT(SysInit(1, lArgv), ::testing::ExitedWithCode(1), qntest::assertionFailure("0 != gspSystem"));
-  EXPECT_EXIT(SysExit(), ::testing::ExitedWithCode(1), qntest::assertionFailure("0 != gspSystem"));
-}
-
-// --- Threads. A component that sleeps until asked to exit, or one that ends by itself at once
-// but refuses exit requests with exception E.
-class WaitingComponent : public QNCThreadComponent {
- public:
-  explicit WaitingComponent(const char* apName) : QNCThreadComponent(apName) {}
-  ~WaitingComponent() override { waitForExit(); }
-
- protected:
-  void run() override {
-    while (!waitForExitRequest(3600u * 1000u)) {
-    }
-  }
-};
-
+// --- Threads. A component refuses exit requests with the exception it is given.
 template <class E>
-class RefusingComponent : public QNCThreadComponent {
- public:
-  explicit RefusingComponent(const char* apName) : QNCThreadComponent(apName) {}
-  ~RefusingComponent() override { waitForExit(); }
-  void requestExit() override {
-    ++mRequests;
+qntest::ScriptedComponent* refusing(const char* apName, std::atomic<int>& arRequests) {
+  auto* lpComponent = new qntest::ScriptedComponent([](qntest::ScriptedComponent&) {}, apName);
+  lpComponent->mRefuse = [&arRequests] {
+    ++arRequests;
     throw E("cannot take the request", 6);
-  }
-  std::atomic<int> mRequests{0};
-
- protected:
-  void run() override {}
-};
+  };
+  return lpComponent;
+}
 
 class ThreadsSystem : public qntest::TableSystem {
  public:
@@ -117,26 +63,11 @@ class ThreadsSystem : public qntest::TableSystem {
     }
     waitForThreads();
   }
-  // Counts only calls made once both parsers exist: the application's descriptors go into them.
-  void setCommandLineArgumentDesc() override {
-    mDescriptorCalls += !mCommandLineParser.isNull() && !mConfigFileParser.isNull();
-  }
   void createShutDownEvent() override {
     ++mShutDownEvents;
     mFlagAtShutDownEvent = isSetForExit();
   }
-  template <class T>
-  T& addComponent(T* apComponent) {
-    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent, QNPST_Individual, QNPAT_New));
-    return *apComponent;
-  }
-  QNCThreadPool& addPool(const char* apName, unsigned int aThreads) {
-    auto* lpPool = new QNCThreadPool(apName, aThreads);
-    mThreadPools.append(QNCPointer<QNCThreadPool>(lpPool, QNPST_Individual, QNPAT_New));
-    return *lpPool;
-  }
-
-  int mDescriptorCalls = 0, mShutDownEvents = 0;
+  int mShutDownEvents = 0;
   bool mFlagAtShutDownEvent = true;
 };
 
@@ -145,9 +76,10 @@ class SystemTest : public qntest::LoggedTest {};
 // A component that refuses the exit request with QNCInvalidEx (as one never started does) must
 // not keep the components after it or any pool from being told, or waitForThreads would hang.
 TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
+  std::atomic<int> lRequests{0};  // outlives the system, whose destructor asks again
   ThreadsSystem lSystem;
-  auto& lRefusing = lSystem.addComponent(new RefusingComponent<QNCInvalidEx>("alpha"));
-  auto& lWaiting = lSystem.addComponent(new WaitingComponent("beta"));
+  lSystem.addComponent(refusing<QNCInvalidEx>("alpha", lRequests));
+  auto& lWaiting = lSystem.addComponent(new qntest::ScriptedComponent({}, "beta"));
   QNCThreadPool& lWorkers = lSystem.addPool("workers", 2);
   QNCThreadPool& lSpare = lSystem.addPool("spare", 1);
   EXPECT_FALSE(lSystem.isInited(0));
@@ -155,44 +87,38 @@ TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
   EXPECT_TRUE(lSystem.isInited(0) && lSystem.isInited(1));
   EXPECT_FALSE(lSystem.isInited(2));
   lSystem.makeThreadsToExit();
-  EXPECT_EQ(1, lRefusing.mRequests);
+  EXPECT_EQ(1, lRequests.load());
   EXPECT_TRUE(lWaiting.isExitRequested());
   EXPECT_THROW(lWorkers.submit([] {}), QNCExitConditionEx);
   EXPECT_THROW(lSpare.submit([] {}), QNCExitConditionEx);
   lSystem.waitForThreads();  // returns: every thread was told
-  const std::string lLog = log();
   expectInOrder(
-      lLog, {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
-             "Started Threads in Thread Pool: spare\n", "Waiting for 'alpha' thread to exit\n",
-             "Waiting for 'beta' thread to exit\n", "Waiting for threads in 'workers' ThreadPool to exit\n",
-             "Waiting for threads in 'spare' ThreadPool to exit\n"});
-  EXPECT_EQ("-N-", levelOf(lLog, "Started Thread: alpha"));
-  EXPECT_EQ("-N-", levelOf(lLog, "Waiting for threads in 'workers' ThreadPool to exit"));
+      log(),
+      {"Started Thread: alpha\n", "Started Thread: beta\n", "Started Threads in Thread Pool: workers\n",
+       "Started Threads in Thread Pool: spare\n", "Waiting for 'alpha' thread to exit\n",
+       "Waiting for 'beta' thread to exit\n", "Waiting for threads in 'workers' ThreadPool to exit\n",
+       "Waiting for threads in 'spare' ThreadPool to exit\n"});
 }
 
 // Nothing is caught in startThreads: the component that cannot start ends it, and neither the
-// components after it nor the pools are started. startThread then starts the one named, alone.
+// components after it nor the pools are started: the service never runs without one of its threads.
 TEST_F(SystemTest, StartThreadsStopsAtTheFirstComponentThatCannotStart) {
   ThreadsSystem lSystem;
-  lSystem.addComponent(new WaitingComponent("first")).init();  // a second init() is refused
-  lSystem.addComponent(new WaitingComponent("second"));
-  lSystem.addComponent(new WaitingComponent("third"));
+  lSystem.addComponent(new qntest::ScriptedComponent({}, "first")).init();  // a second init() is refused
+  lSystem.addComponent(new qntest::ScriptedComponent({}, "second"));
   QNCThreadPool& lPool = lSystem.addPool("late", 1);
   EXPECT_THROW(lSystem.startThreads(), QNCInvalidEx);
   EXPECT_FALSE(lSystem.isInited(1));
   lPool.submit([] {});  // a pool that was never started still accepts work: it was not finished
   EXPECT_EQ(std::string::npos, log().find("Started Thread"));
-  EXPECT_EQ("Vector out of bounds access", qntest::thrown<QNCInvalidEx>([&] { lSystem.startThread(3); }));
-  lSystem.startThread(2);
-  EXPECT_FALSE(lSystem.isInited(1));
-  EXPECT_TRUE(lSystem.isInited(2));
 }
 
 // Only QNCInvalidEx is passed over: another refusal reaches the caller, the flag already set; the
 // shut-down event comes before the flag is set, and the flag never returns to false.
 TEST_F(SystemTest, ExitFlagIsSetFirstAndNeverReturnsToFalse) {
+  std::atomic<int> lRequests{0};  // outlives the system, whose destructor asks again
   ThreadsSystem lSystem;
-  lSystem.addComponent(new RefusingComponent<QNCNotFoundEx>("odd"));
+  lSystem.addComponent(refusing<QNCNotFoundEx>("odd", lRequests));
   lSystem.startThreads();
   EXPECT_FALSE(lSystem.isSetForExit());
   EXPECT_THROW(lSystem.makeThreadsToExit(), QNCNotFoundEx);
@@ -202,26 +128,6 @@ TEST_F(SystemTest, ExitFlagIsSetFirstAndNeverReturnsToFalse) {
   lSystem.setForExit();
   EXPECT_EQ(2, lSystem.mShutDownEvents);
   EXPECT_TRUE(lSystem.isSetForExit());
-}
-
-TEST_F(SystemTest, PreInitCreatesTheParsersFirstAndInitFindsTheHostName) {
-  ThreadsSystem lSystem;
-  lSystem.preInit();
-  EXPECT_EQ(QNOS_Linux, lSystem.getOs());
-  EXPECT_EQ(1, lSystem.mDescriptorCalls);
-  lSystem.init();
-  char lHostName[256] = {0};
-  ASSERT_EQ(0, gethostname(lHostName, sizeof lHostName - 1));
-  EXPECT_STREQ(lHostName, lSystem.getHostName().get());
-  ASSERT_FALSE(lSystem.getAddress().isNull());
-  const std::string lLog = log();
-  expectInOrder(lLog, {std::string("HostName: ") + lHostName + "\n",
-                       "IpAddress: " + std::string(lSystem.getAddress()->getStringForm()) + "\n"});
-  EXPECT_EQ("-I-", levelOf(lLog, "The IP Address of the host in number form: "));
-  // init() creates the identifier manager, starting at 1.
-  unsigned int lId = 0;
-  lSystem.generateNumericId(lId);
-  EXPECT_EQ(1u, lId);
 }
 
 // --- Settings. applySettings changes the process-wide log mask and heartbeat: restored after.
@@ -245,37 +151,32 @@ class SettingsSystem : public qntest::TableSystem {
   std::vector<std::string> mDaemonizeCalls;
 };
 
+unsigned int current(void (*apGet)(unsigned int&)) {
+  unsigned int lValue = 0;
+  apGet(lValue);
+  return lValue;
+}
+
 class SettingsTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    getLogCode(mSavedLogCode);
-    getHbTimeout(mSavedHbTimeout);
-  }
   void TearDown() override {
     setLogCode(mSavedLogCode);
     setHbTimeout(mSavedHbTimeout);
   }
-  static unsigned int logCode() {
-    unsigned int lValue = 0;
-    getLogCode(lValue);
-    return lValue;
-  }
-  static unsigned int hbTimeout() {
-    unsigned int lValue = 0;
-    getHbTimeout(lValue);
-    return lValue;
-  }
 
   SettingsSystem mSystem;
-  unsigned int mSavedLogCode = 0, mSavedHbTimeout = 0;
+  const unsigned int mSavedLogCode = current(getLogCode), mSavedHbTimeout = current(getHbTimeout);
 };
 
-TEST_F(SettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
+// Daemonize 1 (and nothing else) daemonizes. With -c the file must supply the three keys; a
+// missing one ends start-up after the earlier ones were applied. A value of the wrong kind is an
+// exception, not a value.
+TEST_F(SettingsTest, ApplySettingsSetsTheLoggerDaemonizesOnlyForOneAndStopsAtABadKey) {
   mSystem.addAll(new QNCMultiType(121u), new QNCMultiType(45u),
                  new QNCMultiType(static_cast<signed char>(1)));
   mSystem.applySettings();
-  EXPECT_EQ(121u, logCode());
-  EXPECT_EQ(45u, hbTimeout());
+  EXPECT_EQ(121u, current(getLogCode));
+  EXPECT_EQ(45u, current(getHbTimeout));
   EXPECT_EQ(std::vector<std::string>{"/|/dev/null|/dev/null|/dev/null"}, mSystem.mDaemonizeCalls);
   for (signed char lOther : {0, 2, -1}) {
     SettingsSystem lSystem;
@@ -283,48 +184,34 @@ TEST_F(SettingsTest, ApplySettingsSetsLoggerAndDaemonizesOnlyForOne) {
     lSystem.applySettings();
     EXPECT_TRUE(lSystem.mDaemonizeCalls.empty()) << static_cast<int>(lOther);
   }
-}
-
-// With -c the file must supply the three keys; a missing one ends start-up after the earlier
-// ones were applied. A value of the wrong kind is an exception, not a value.
-TEST_F(SettingsTest, ApplySettingsStopsAtTheFirstMissingOrWrongKey) {
-  setHbTimeout(30);
-  mSystem.addAll(new QNCMultiType(249u), nullptr, new QNCMultiType(static_cast<signed char>(1)));
-  EXPECT_THROW(mSystem.applySettings(), QNCNotFoundEx);
-  EXPECT_EQ(249u, logCode());
-  EXPECT_EQ(30u, hbTimeout());
-  EXPECT_TRUE(mSystem.mDaemonizeCalls.empty());
-  SettingsSystem lWrongKind;
+  SettingsSystem lMissing, lWrongKind;
+  lMissing.addAll(new QNCMultiType(249u), nullptr, new QNCMultiType(static_cast<signed char>(1)));
+  EXPECT_THROW(lMissing.applySettings(), QNCNotFoundEx);
+  EXPECT_EQ(249u, current(getLogCode));
+  EXPECT_EQ(30u, current(getHbTimeout));
+  EXPECT_TRUE(lMissing.mDaemonizeCalls.empty());
   lWrongKind.addAll(new QNCMultiType("16"), new QNCMultiType(30u), new QNCMultiType(1u));
   EXPECT_THROW(lWrongKind.applySettings(), QNCInvalidEx);
 }
 
-// Each thread marks the identifiers it holds in a shared table; a second holder of the same
-// identifier finds the mark already set. The small bound makes identifiers circulate.
+// Each thread marks the identifier it holds in a shared table, then returns it; a second holder of
+// the same identifier finds the mark already set. The small bound makes identifiers circulate.
 TEST_F(SettingsTest, ConcurrentThreadsNeverHoldTheSameIdentifier) {
-  constexpr unsigned int kBound = 32;
+  constexpr unsigned int kBound = 8;
   mSystem.useIdentifierBound(kBound);
   std::vector<std::atomic<bool>> lHeld(kBound + 1);
   std::atomic<unsigned int> lFaults{0};
   std::vector<std::thread> lThreads;
   for (unsigned int lThread = 0; lThread < 4; ++lThread) {
     lThreads.emplace_back([&] {
-      std::vector<unsigned int> lMine;
-      for (unsigned int lRound = 0; lRound < 2000; ++lRound) {
+      for (unsigned int lRound = 0; lRound < 4000; ++lRound) {
         unsigned int lId = 0;
         mSystem.generateNumericId(lId);
-        if (lId == 0 || lId > kBound || lHeld[lId].exchange(true)) {
-          ++lFaults;
-          continue;
-        }
-        lMine.push_back(lId);
-        if (lMine.size() == kBound / 4) {
-          for (unsigned int lReturned : lMine) {
-            lHeld[lReturned].store(false);
-            mSystem.returnNumericId(lReturned);
-          }
-          lMine.clear();
-        }
+        ASSERT_TRUE(lId != 0 && lId <= kBound);
+        lFaults += lHeld[lId].exchange(true);
+        std::this_thread::yield();
+        lHeld[lId].store(false);
+        mSystem.returnNumericId(lId);
       }
     });
   }
@@ -332,21 +219,35 @@ TEST_F(SettingsTest, ConcurrentThreadsNeverHoldTheSameIdentifier) {
   EXPECT_EQ(0u, lFaults.load());
 }
 
+// Identifiers start at 1 and returned ones come back first; one never issued, or returned twice,
+// is refused (a double return would hand it to two users), and so is a request past the bound.
 // A refusal that left mNidCreationLock held would block the next call for ever.
-TEST_F(SettingsTest, IdentifierRefusalsLeaveTheLockFree) {
+TEST_F(SettingsTest, IdentifiersAreReusedAndRefusalsLeaveTheLockFree) {
+  mSystem.useIdentifierBound(4);
   unsigned int lId = 0;
-  mSystem.useIdentifierBound(2);
-  mSystem.generateNumericId(lId);
-  mSystem.generateNumericId(lId);
-  EXPECT_THROW(mSystem.generateNumericId(lId), QNCNotFoundEx);
-  EXPECT_THROW(mSystem.returnNumericId(7), QNCInvalidEx);
+  auto lNext = [&] {
+    mSystem.generateNumericId(lId);
+    return lId;
+  };
+  for (unsigned int lExpected = 1; lExpected <= 3; ++lExpected) EXPECT_EQ(lExpected, lNext());
+  mSystem.returnNumericId(3);
   mSystem.returnNumericId(1);
-  mSystem.generateNumericId(lId);
-  EXPECT_EQ(1u, lId);
+  EXPECT_EQ("Numeric identifier 0 is not in use, cannot return it",
+            qntest::thrown<QNCInvalidEx>([&] { mSystem.returnNumericId(0); }));
+  for (unsigned int lRefused : {1u, 4u}) EXPECT_THROW(mSystem.returnNumericId(lRefused), QNCInvalidEx);
+  EXPECT_EQ(3u, lNext());
+  EXPECT_EQ(1u, lNext());
+  EXPECT_EQ(4u, lNext());
+  lId = 77;
+  EXPECT_EQ("No numeric identifier is free: all of 1..4 are in use",
+            qntest::thrown<QNCNotFoundEx>([&] { mSystem.generateNumericId(lId); }));
+  EXPECT_EQ(77u, lId);
+  mSystem.returnNumericId(2);
+  EXPECT_EQ(2u, lNext());
 }
 
-// --- The common command-line options, run in-process. The instance operations are faked so that
-// "-s" can be followed without a second process; each call prints a marker.
+// --- The common command-line options, run in-process ("-s" is followed by QnsensordTest, with a
+// real instance to stop).
 const QNSCommandLineArgumentDesc kCommonOptions[] = {
     {"-v", 0, "", ""},     {"-h", 0, "", ""},        {"-s", 0, "", ""},     {"-c", 1, "file", ""},
     {"-d", 1, "mask", ""}, {"-b", 1, "seconds", ""}, {"-D", 1, "bool", ""}, {"-I", 1, "minutes", ""},
@@ -354,21 +255,10 @@ const QNSCommandLineArgumentDesc kCommonOptions[] = {
 
 class CommandLineSystem : public qntest::TableSystem {
  public:
-  explicit CommandLineSystem(bool aConfigAsFlag = false) : mConfigAsFlag(aConfigAsFlag) {
-    mName = "sensortest";
-    mVersion = QNCPointer<QNCVersion>(new (std::nothrow) QNCVersion("9.8.7"));
-  }
+  CommandLineSystem() { mName = "sensortest"; }
   void setCommandLineArgumentDesc() override {
-    for (QNSCommandLineArgumentDesc lDesc : kCommonOptions) {
-      if (mConfigAsFlag && std::string(lDesc.mOption) == "-c") lDesc.mTakesValue = 0;
-      mCommandLineArgumentDesc.append(lDesc);
-    }
+    for (const QNSCommandLineArgumentDesc& lrDesc : kCommonOptions) mCommandLineArgumentDesc.append(lrDesc);
   }
-  bool isAnInstanceRunning() override {
-    printf("[checked]");
-    return mInstanceRunning;
-  }
-  void killRunningInstance() override { printf("[killed]"); }
   // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest".
   void process(const std::vector<std::string>& acrArguments) {
     std::vector<std::string> lStorage{"sensortest"};
@@ -386,10 +276,6 @@ class CommandLineSystem : public qntest::TableSystem {
                                              : static_cast<int>(static_cast<unsigned int>(*lValue));
   }
   unsigned int settingCount() const { return mSettings.numberOfElements(); }
-  bool mInstanceRunning = false;
-
- private:
-  bool mConfigAsFlag;
 };
 
 // Logs to a file of its own, with a recognisable log mask and heartbeat, so the defaults can be
@@ -436,29 +322,6 @@ TEST_F(CommandLineTest, GivenValuesReplaceOnlyTheirOwnDefaultsReadLikeAtoi) {
       log(), {"Command line : '-d 16 -I 30'", "Processed the command line successfully : -d 16 -I 30",
               "No arguments in command line", "The -I option is not specified, using default interval 15 min",
               "Zero/Invalid value specified for -I option. DB won't be reopened at fixed intervals"});
-}
-
-// -s stops a running instance, or says that there is none; either way the process leaves through
-// QNCParentExitEx before any setting is written.
-TEST_F(CommandLineTest, ShutdownStopsTheRunningInstanceAndLeavesWithParentExit) {
-  for (const bool lRunning : {true, false}) {
-    CommandLineSystem lSystem;
-    lSystem.mInstanceRunning = lRunning;
-    testing::internal::CaptureStdout();
-    const std::string lThrown = qntest::thrown<QNCParentExitEx>([&] { lSystem.process({"-s"}); }, true);
-    EXPECT_EQ(lRunning ? "Done.. time to exit (code 19)" : "Done (nothing).. time to exit (code 19)",
-              lThrown);
-    EXPECT_EQ(lRunning ? "[checked][killed]sensortest shutdown successfully.\n" : "[checked]",
-              testing::internal::GetCapturedStdout());
-    EXPECT_EQ(0u, lSystem.settingCount());
-  }
-  EXPECT_NE(std::string::npos, log().find("No instance running.. cannot kill"));
-}
-
-TEST(CommandLineDeathTest, ConfigFileDescribedWithoutValueIsAnAssertion) {
-  CommandLineSystem lSystem(true);
-  EXPECT_EXIT(lSystem.process({"-c"}), ::testing::ExitedWithCode(1),
-              "Assertion \\[ __null != lpArg \\] failed");
 }
 
 }  // namespace

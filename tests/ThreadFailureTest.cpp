@@ -5,50 +5,32 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
 #include <stdexcept>
+#include <string>
+#include <vector>
 
-#include "DeathTestSupport.h"
 #include "LogSupport.h"
 #include "RunStatus.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
-#include "ThreadComponent.h"
-#include "ThreadPool.h"
 
 namespace {
 
-// Throws from run() aFailures times, then waits for its exit request.
-class FailingComponent : public QNCThreadComponent {
- public:
-  FailingComponent(const char* apName, int aFailures, bool aRestart)
-      : QNCThreadComponent(apName), mFailures(aFailures), mRestart(aRestart) {}
-  std::atomic<int> mRuns{0};
+// Throws from its body aFailures times, then waits for its exit request.
+qntest::ScriptedComponent* failing(const char* apName, int aFailures, bool aRestart) {
+  auto* lpComponent = new qntest::ScriptedComponent(
+      [aFailures](qntest::ScriptedComponent& arSelf) {
+        if (arSelf.mRuns.load() <= aFailures) throw std::runtime_error("sensor bus gone");
+        while (!arSelf.waitForExitRequest(1000)) {
+        }
+      },
+      apName);
+  lpComponent->mRestart = aRestart;
+  return lpComponent;
+}
 
- protected:
-  void run() override {
-    if (mRuns.fetch_add(1) < mFailures) throw std::runtime_error("sensor bus gone");
-    while (!waitForExitRequest(1000)) {
-    }
-  }
-  bool restartAfterFailure(const char* apWhat) override {
-    return mRestart ? true : QNCThreadComponent::restartAfterFailure(apWhat);
-  }
-
- private:
-  const int mFailures;
-  const bool mRestart;
-};
-
-class FailureSystem : public qntest::TableSystem {
- public:
-  FailureSystem() : TableSystem(0, 0, 0) {}
-  void add(QNCThreadComponent* apComponent) {
-    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent));
-  }
-  void add(QNCThreadPool* apPool) { mThreadPools.append(QNCPointer<QNCThreadPool>(apPool)); }
-};
-
-FailureSystem* gspSystem = nullptr;
+qntest::TableSystem* gspSystem = nullptr;
 std::atomic<int> gsExitRequests{0};
 void requestExit() {
   ++gsExitRequests;
@@ -66,14 +48,13 @@ class ThreadFailureTest : public qntest::LoggedTest {
     QNSetExitRequest(nullptr);
     LoggedTest::TearDown();
   }
-  FailureSystem mSystem;
+  qntest::TableSystem mSystem;
 };
 
 // Two failures, each restarted by the override: the third run serves until the exit request; the
 // run has not failed and nobody asked for an exit.
 TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
-  FailingComponent* lpComponent = new FailingComponent("Restarter", 2, true);
-  mSystem.add(lpComponent);
+  qntest::ScriptedComponent* lpComponent = &mSystem.addComponent(failing("Restarter", 2, true));
   mSystem.startThreads();
   while (lpComponent->mRuns.load() < 3) std::this_thread::yield();
   mSystem.makeThreadsToExit();
@@ -90,9 +71,9 @@ TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
 // ends the others, so waitForThreads returns. Before: the others ran on and the status stayed 0.
 TEST_F(ThreadFailureTest, DyingThreadFailsTheRunAndEndsTheOthers) {
   const int lBefore = gsExitRequests.load();
-  mSystem.add(new FailingComponent("Bystander", 0, false));  // started first: it can take the request
-  mSystem.add(new FailingComponent("Dying", 1, false));
-  mSystem.add(new QNCThreadPool("Pool", 1));
+  mSystem.addComponent(failing("Bystander", 0, false));  // started first: it can take the request
+  mSystem.addComponent(failing("Dying", 1, false));
+  mSystem.addPool("Pool", 1);
   mSystem.startThreads();
   EXPECT_TRUE(qntest::returnsWithin([this] { mSystem.waitForThreads(); }, std::chrono::seconds(5),
                                     [this] { mSystem.makeThreadsToExit(); }));
@@ -102,19 +83,27 @@ TEST_F(ThreadFailureTest, DyingThreadFailsTheRunAndEndsTheOthers) {
   EXPECT_EQ("-E-", qntest::levelOf(log(), "Thread 'Dying' ended by an exception: sensor bus gone"));
 }
 
-// A pool task that throws fails the run the same way; the worker goes on with the next task.
+// A pool task that throws fails the run the same way, whatever it throws (an exception leaving
+// the thread function would call std::terminate); the worker goes on with the next task. The
+// text of the error line is shared with the components' own.
 TEST_F(ThreadFailureTest, FailingPoolTaskFailsTheRun) {
   const int lBefore = gsExitRequests.load();
+  const std::vector<std::pair<std::function<void()>, std::string>> lCases = {
+      {[] { throw QNCInvalidEx("sensor lost", 6); }, "sensor lost"},
+      {[] { throw std::runtime_error("report lost"); }, "report lost"},
+      {[] { throw 42; }, "unknown exception"}};
   QNCThreadPool lPool("Failing", 1);
   std::atomic<int> lLaterTasks{0};
   lPool.init();
-  lPool.submit([] { throw std::runtime_error("report lost"); });
+  for (const auto& lrCase : lCases) lPool.submit(lrCase.first);
   lPool.submit([&lLaterTasks] { ++lLaterTasks; });
   lPool.finish();
   lPool.waitForThreads();
   EXPECT_EQ(1, lLaterTasks.load());
-  EXPECT_EQ(lBefore + 1, gsExitRequests.load());
-  EXPECT_EQ("-E-", qntest::levelOf(log(), "ThreadPool 'Failing': task failed: report lost"));
+  EXPECT_EQ(lBefore + 3, gsExitRequests.load());
+  const std::string lLog = log();
+  for (const auto& lrCase : lCases)
+    EXPECT_EQ("-E-", qntest::levelOf(lLog, "ThreadPool 'Failing': task failed: " + lrCase.second)) << lLog;
 }
 
 }  // namespace

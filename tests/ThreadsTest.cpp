@@ -7,9 +7,9 @@
 #include <condition_variable>
 #include <future>
 #include <mutex>
-#include <stdexcept>
 
 #include "LogSupport.h"
+#include "TableSystem.h"
 #include "ThreadComponent.h"
 #include "ThreadPool.h"
 
@@ -17,25 +17,7 @@ namespace {
 
 constexpr unsigned int kHour = 3600u * 1000u;
 
-// A component whose body is given by the test; it joins in its own destructor, before the body
-// (a member) is destroyed, unless told to leave that to the base destructor.
-class ScriptedComponent : public QNCThreadComponent {
- public:
-  using Body = std::function<void(ScriptedComponent&)>;
-  ScriptedComponent(Body aBody, bool aJoin = true)
-      : QNCThreadComponent("scripted"), mBody(std::move(aBody)), mJoin(aJoin) {}
-  ~ScriptedComponent() override {
-    if (mJoin) waitForExit();
-  }
-  using QNCThreadComponent::waitForExitRequest;
-
- protected:
-  void run() override { mBody(*this); }
-
- private:
-  Body mBody;
-  bool mJoin;
-};
+using qntest::ScriptedComponent;
 
 // Fault pinned for the request made first: a wait that only listens for notifications would
 // sleep the whole period instead of seeing the request already given.
@@ -94,7 +76,7 @@ TEST(ThreadComponentTest, DestructorEndsAndJoinsARunningThread) {
         }
         gsSleeperReturned = true;
       },
-      false);
+      "scripted", false);
   lpComponent->init();
   lAsleep.get_future().wait();
   delete lpComponent;
@@ -178,39 +160,6 @@ TEST(ThreadPoolTest, MisuseIsRefusedWithClearErrors) {
   lPool.waitForThreads();
   lPool.waitForThreads();  // already joined
   EXPECT_EQ(1, lRefused);
-}
-
-// An exception leaving a thread function would call std::terminate; from a component's body or a
-// pool's task each kind is logged at error level with its message, and the pool's worker (the
-// only one) goes on to run the task after it.
-class ThreadsLogTest : public qntest::LoggedTest {};
-
-TEST_F(ThreadsLogTest, AnExceptionFromABodyOrATaskIsLoggedAndWorkGoesOn) {
-  const std::vector<std::pair<std::function<void()>, std::string>> lCases = {
-      {[] { throw QNCInvalidEx("sensor lost", 6); }, "sensor lost"},
-      {[] { throw std::runtime_error("bus error"); }, "bus error"},
-      {[] { throw 42; }, "unknown exception"}};
-  std::atomic<int> lAfter{0};
-  {
-    QNCThreadPool lPool("fragile", 1);
-    lPool.init();
-    for (const auto& lrCase : lCases) {
-      ScriptedComponent lComponent([&](ScriptedComponent&) { lrCase.first(); });
-      lComponent.init();
-      lComponent.waitForExit();
-      lPool.submit(lrCase.first);
-    }
-    lPool.submit([&] { ++lAfter; });
-    lPool.finish();
-    lPool.waitForThreads();
-  }
-  EXPECT_EQ(1, lAfter);
-  const std::string lLog = log();
-  for (const auto& lrCase : lCases) {
-    EXPECT_EQ("-E-", qntest::levelOf(lLog, "Thread 'scripted' ended by an exception: " + lrCase.second))
-        << lLog;
-    EXPECT_EQ("-E-", qntest::levelOf(lLog, "ThreadPool 'fragile': task failed: " + lrCase.second)) << lLog;
-  }
 }
 
 }  // namespace

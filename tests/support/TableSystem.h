@@ -1,8 +1,9 @@
 #pragma once
 // The one minimal system object of the tests and the helper program: the three operations every
 // application must provide (no options, no configuration file, no help), numbered tables filled
-// the way an application's system class does, the conditionals themselves so tests can take a
-// conditional's lock directly, and on request an instance manager on a given PID file.
+// the way an application's system class does (threads included), the conditionals themselves so
+// tests can take a conditional's lock directly, and on request an instance manager on a given PID
+// file. Beside it, the scripted thread component the thread tests share.
 
 #include <atomic>
 #include <chrono>
@@ -19,6 +20,8 @@
 #include "SynchList.h"
 #include "SynchQueue.h"
 #include "System.h"
+#include "ThreadComponent.h"
+#include "ThreadPool.h"
 #include "Writer.h"
 
 namespace qntest {
@@ -77,6 +80,44 @@ inline bool returnsWithin(const std::function<void()>& acrCall, std::chrono::mil
   return lInTime;
 }
 
+// A thread component whose body the test gives (by default: wait for the exit request). It
+// counts its runs, may refuse exit requests (mRefuse runs first and may throw) or restart after
+// a failure, and joins in its own destructor, before its members go, unless told to leave that to
+// the base destructor.
+class ScriptedComponent : public QNCThreadComponent {
+ public:
+  using Body = std::function<void(ScriptedComponent&)>;
+  explicit ScriptedComponent(Body aBody = {}, const char* apName = "scripted", bool aJoin = true)
+      : QNCThreadComponent(apName), mBody(std::move(aBody)), mJoin(aJoin) {}
+  ~ScriptedComponent() override {
+    if (mJoin) waitForExit();
+  }
+  void requestExit() override {
+    if (mRefuse) mRefuse();
+    QNCThreadComponent::requestExit();
+  }
+  using QNCThreadComponent::waitForExitRequest;
+
+  std::function<void()> mRefuse;  // set before init()
+  bool mRestart = false;          // set before init()
+  std::atomic<int> mRuns{0};
+
+ protected:
+  void run() override {
+    ++mRuns;
+    if (mBody) return mBody(*this);
+    while (!waitForExitRequest(3600u * 1000u)) {
+    }
+  }
+  bool restartAfterFailure(const char* apWhat) override {
+    return mRestart || QNCThreadComponent::restartAfterFailure(apWhat);
+  }
+
+ private:
+  Body mBody;
+  bool mJoin;
+};
+
 class TableSystem : public QNCSystem {
  public:
   TableSystem(unsigned int aConditionals = 0, unsigned int aQueues = 0, unsigned int aLists = 0) {
@@ -95,6 +136,16 @@ class TableSystem : public QNCSystem {
   void addWriter(const QNCPointer<QNCWriter>& acrWriter) { mWriters.append(acrWriter); }
 
   void addBucket(unsigned int aLength) { mMemoryBufferList.pushBack(aLength); }
+  template <class T>
+  T& addComponent(T* apComponent) {
+    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent, QNPST_Individual, QNPAT_New));
+    return *apComponent;
+  }
+  QNCThreadPool& addPool(const char* apName, unsigned int aThreads) {
+    mThreadPools.append(
+        QNCPointer<QNCThreadPool>(new QNCThreadPool(apName, aThreads), QNPST_Individual, QNPAT_New));
+    return *mThreadPools[mThreadPools.numberOfElements() - 1];
+  }
   void usePidFile(const char* apPath) {
     mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
         new (std::nothrow) QNCProcessInstanceManager(apPath), QNPST_Individual, QNPAT_New);
