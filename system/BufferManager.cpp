@@ -44,14 +44,30 @@ QNCBufferManager::~QNCBufferManager() {
   QN_LEFT();
 }
 
-void QNCBufferManager::_determineBucketNo(unsigned int aLength, unsigned int& arBucketNo) const {
-  QN_ENTERED();
+// A line of the operation acpFunction (get or reuse, whose work runs in a helper), written as
+// the mask decides at that moment. Trace lines exist only in the instantiation with acTrace.
+#define QN_POOL_LOG(level, tag, acpFunction, ...)                                             \
+  do {                                                                                        \
+    if (QNIsLogLevelOn(level))                                                                \
+      PrintLogMessageWithTimeStamp(level, tag, __LINE__, acpFunction, __FILE__, __VA_ARGS__); \
+  } while (0)
+#define QN_POOL_TRACE(acpFunction, ...)                                    \
+  do {                                                                     \
+    if (acTrace) QN_POOL_LOG(QNLL_Trace, "-T-", acpFunction, __VA_ARGS__); \
+  } while (0)
+
+template <bool acTrace>
+[[gnu::always_inline]] inline void QNCBufferManager::_determineBucketNo(unsigned int aLength,
+                                                                        unsigned int& arBucketNo) const {
+  if (acTrace) QN_ENTERED();
+  // The lengths never change after construction and there is at least one (asserted then).
+  const unsigned int* const lpLengths = &mBufferLengths[0];
   const unsigned int lCount = mBufferLengths.numberOfElements();
   for (unsigned int lIndex = 0; lIndex < lCount; ++lIndex) {
-    if (mBufferLengths[lIndex] >= aLength) {
+    if (lpLengths[lIndex] >= aLength) {
       arBucketNo = lIndex;
-      QN_LOG_TRACE("Determined bucket number is %u", lIndex);
-      QN_LEFT();
+      if (acTrace) QN_LOG_TRACE("Determined bucket number is %u", lIndex);
+      if (acTrace) QN_LEFT();
       return;
     }
   }
@@ -59,35 +75,38 @@ void QNCBufferManager::_determineBucketNo(unsigned int aLength, unsigned int& ar
   throw QNCNotFoundEx("Cannot find a buffer bucket", 8);
 }
 
-void QNCBufferManager::get(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer) {
-  QN_ENTERED();
+template <bool acTrace>
+[[gnu::always_inline]] inline void QNCBufferManager::_get(unsigned int aLength,
+                                                          QNCPointer<QNCBuffer>& arBuffer) {
+  QN_POOL_TRACE("get", "%s", "Entered");
   QNCMutex* lHeldMutex = nullptr;  // the bucket's mutex while this call holds it
   try {
-    QN_LOG_TRACE("Determining bucket number for %u length", aLength);
+    QN_POOL_TRACE("get", "Determining bucket number for %u length", aLength);
     unsigned int lIndex = 0;
-    _determineBucketNo(aLength, lIndex);
+    _determineBucketNo<acTrace>(aLength, lIndex);
     QN_ASSERT(lIndex < this->mBufferQueues.numberOfElements());
-    QNCMutex& lMutex = *mBufferQueueMutexes[lIndex];
-    QNCBufferQueue& lQueue = *mBufferQueues[lIndex];
+    // Made non-null at construction and never changed.
+    QNCMutex& lMutex = *mBufferQueueMutexes[lIndex].get();
+    QNCBufferQueue& lQueue = *mBufferQueues[lIndex].get();
 
-    QN_LOG_TRACE("Locking bucket # %u", lIndex);
+    QN_POOL_TRACE("get", "Locking bucket # %u", lIndex);
     lMutex.lock();
     lHeldMutex = &lMutex;
-    QN_LOG_TRACE("Getting buffer length of bucket # %u", lIndex);
+    QN_POOL_TRACE("get", "Getting buffer length of bucket # %u", lIndex);
     const unsigned int lBufferSize = _bucketBufferLength(lIndex);
     QN_ASSERT(0 != lBufferSize);
     QNCPointer<QNCBuffer> lBuffer;
     if (lQueue.isEmpty()) {
-      QN_LOG_TRACE("No existing buffers.. creating new of %u size", lBufferSize);
+      QN_POOL_TRACE("get", "No existing buffers.. creating new of %u size", lBufferSize);
       lBuffer = QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, lBufferSize),
                                       QNPST_Individual, QNPAT_New);
     } else {
-      QN_LOG_TRACE("Got buffer of %u length from bucket # %u", lBufferSize, lIndex);
+      QN_POOL_TRACE("get", "Got buffer of %u length from bucket # %u", lBufferSize, lIndex);
       lBuffer = lQueue.dequeue();
       // Cannot fail: reuse() pools only buffers whose capacity reaches their bucket's length.
-      lBuffer->setLength(aLength);
+      lBuffer.get()->setLength(aLength);
     }
-    QN_LOG_TRACE("Unlocking bucket # %u", lIndex);
+    QN_POOL_TRACE("get", "Unlocking bucket # %u", lIndex);
     lHeldMutex = nullptr;
     lMutex.unlock();
     // Assigned after the unlock: the caller's previous buffer may be destroyed here, and that
@@ -95,53 +114,72 @@ void QNCBufferManager::get(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer
     arBuffer = std::move(lBuffer);
   } catch (QNCException& arException) {
     if (lHeldMutex != nullptr) lHeldMutex->unlock();
-    QN_LOG_ERROR("Cannot allocate a buffer");
+    QN_POOL_LOG(QNLL_Error, "-E-", "get", "Cannot allocate a buffer");
     throw QNCNoMemoryEx(arException.what(), 2);
   }
-  QN_LEFT();
+  QN_POOL_TRACE("get", "%s", "Left");
 }
 
-void QNCBufferManager::reuse(QNCPointer<QNCBuffer>& arBuffer) {
-  QN_ENTERED();
-  const unsigned int lLength = arBuffer->getLength();
+template <bool acTrace>
+[[gnu::always_inline]] inline void QNCBufferManager::_reuse(QNCPointer<QNCBuffer>& arBuffer) {
+  QN_POOL_TRACE("reuse", "%s", "Entered");
+  QNCBuffer& lBuffer = *arBuffer;
+  const unsigned int lLength = lBuffer.getLength();
   if (lLength > kMaxPooledLength) {
-    QN_LOG_TRACE("Buffer too big... Need not be reused");
-    QN_LEFT();
+    QN_POOL_TRACE("reuse", "Buffer too big... Need not be reused");
+    QN_POOL_TRACE("reuse", "%s", "Left");
     return;
   }
-  QN_LOG_TRACE("Determining bucket number for %u buffer length", lLength);
+  QN_POOL_TRACE("reuse", "Determining bucket number for %u buffer length", lLength);
   unsigned int lIndex = 0;
   try {
-    _determineBucketNo(lLength, lIndex);
+    _determineBucketNo<acTrace>(lLength, lIndex);
   } catch (QNCNotFoundEx& arException) {
-    QN_LOG_ERROR("Failed to determine bucket no, error: %s", arException.what());
-    QN_LEFT();
+    QN_POOL_LOG(QNLL_Error, "-E-", "reuse", "Failed to determine bucket no, error: %s", arException.what());
+    QN_POOL_TRACE("reuse", "%s", "Left");
     return;
   }
   // A buffer the manager made always passes; one made elsewhere with a smaller capacity would
   // later be asked for a length it cannot hold, so it is dropped here instead.
   const unsigned int lBucketLength = _bucketBufferLength(lIndex);
-  if (arBuffer->getCapacity() < lBucketLength) {
-    QN_LOG_TRACE("Buffer capacity %u below bucket # %u length %u... Need not be reused",
-                 arBuffer->getCapacity(), lIndex, lBucketLength);
-    QN_LEFT();
+  if (lBuffer.getCapacity() < lBucketLength) {
+    QN_POOL_TRACE("reuse", "Buffer capacity %u below bucket # %u length %u... Need not be reused",
+                  lBuffer.getCapacity(), lIndex, lBucketLength);
+    QN_POOL_TRACE("reuse", "%s", "Left");
     return;
   }
-  QNCMutex& lMutex = *mBufferQueueMutexes[lIndex];
-  QNCBufferQueue& lQueue = *mBufferQueues[lIndex];
+  // Made non-null at construction and never changed.
+  QNCMutex& lMutex = *mBufferQueueMutexes[lIndex].get();
+  QNCBufferQueue& lQueue = *mBufferQueues[lIndex].get();
   // The queue's own reference, taken before the lock so that its counter update does not
   // lengthen the locked section; should the enqueue fail it is dropped after the unlock.
   QNCPointer<QNCBuffer> lQueued(arBuffer);
-  QN_LOG_TRACE("Locking bucket # %u", lIndex);
+  QN_POOL_TRACE("reuse", "Locking bucket # %u", lIndex);
   lMutex.lock();
-  QN_LOG_TRACE("Queuing buffer to be reused in bucket # %u", lIndex);
+  QN_POOL_TRACE("reuse", "Queuing buffer to be reused in bucket # %u", lIndex);
   try {
     lQueue.enqueue(std::move(lQueued));
   } catch (QNCException&) {
     lMutex.unlock();
     throw;
   }
-  QN_LOG_TRACE("Unlocking bucket # %u", lIndex);
+  QN_POOL_TRACE("reuse", "Unlocking bucket # %u", lIndex);
   lMutex.unlock();
-  QN_LEFT();
+  QN_POOL_TRACE("reuse", "%s", "Left");
+}
+
+void QNCBufferManager::get(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer) {
+  if (QNIsLogLevelOn(QNLL_Trace)) {
+    _get<true>(aLength, arBuffer);
+  } else {
+    _get<false>(aLength, arBuffer);
+  }
+}
+
+void QNCBufferManager::reuse(QNCPointer<QNCBuffer>& arBuffer) {
+  if (QNIsLogLevelOn(QNLL_Trace)) {
+    _reuse<true>(arBuffer);
+  } else {
+    _reuse<false>(arBuffer);
+  }
 }

@@ -1,10 +1,10 @@
 #include "ProtocolHelper.h"
 
 #include <new>
+#include <utility>
 
 #include "AllocatedBuffer.h"
 #include "Clib.h"
-#include "LocalBuffer.h"
 #include "Logger.h"
 #include "QNException.h"
 #include "Reader.h"
@@ -19,6 +19,27 @@ QNCPointer<QNCBuffer> newBuffer(unsigned int acLength) {
   return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(acLength, 0), QNPST_Individual,
                                QNPAT_New);
 }
+
+// This thread's 4-byte buffer for size prefixes, so that framing a message allocates nothing for
+// its prefix.
+thread_local QNCPointer<QNCBuffer> tPrefix;
+
+// Lends the prefix buffer to one read or write of a prefix and takes it back on every way out.
+// Moved, not copied, so the loan costs no counter traffic. When a reader or writer kept a
+// reference to the last buffer, it keeps that buffer unchanged and a new one is lent instead; a
+// call that frames another message on this thread meanwhile (from inside a reader, say) finds no
+// buffer to borrow and makes its own.
+class QNCPrefixLoan {
+ public:
+  QNCPrefixLoan() : mBuffer(std::move(tPrefix)) {
+    if (!mBuffer.isSoleOwner()) mBuffer = newBuffer(sizeof(unsigned int));
+  }
+  ~QNCPrefixLoan() { tPrefix = std::move(mBuffer); }
+  QNCPrefixLoan(const QNCPrefixLoan&) = delete;
+  QNCPrefixLoan& operator=(const QNCPrefixLoan&) = delete;
+
+  QNCPointer<QNCBuffer> mBuffer;
+};
 
 // A peer decides how often a message is oversized, so its line is rate-limited (WarningLimiter.h).
 // Made on first use: after the logger's statics, and destroyed before them.
@@ -61,7 +82,7 @@ void QNCProtocolHelper::read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuff
   }
   QNCPointer<QNCBuffer> lMessage = newBuffer(lreadsize);
   __gather(arReader, lMessage, lreadsize);
-  arBuffer = lMessage;
+  arBuffer = std::move(lMessage);
   QN_LEFT();
 }
 
@@ -75,9 +96,9 @@ void QNCProtocolHelper::write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<
 
 void QNCProtocolHelper::__readSize(QNCPointer<QNCReader>& arReader, unsigned int& arSize) {
   QN_ENTERED();
-  QNCPointer<QNCBuffer> lPrefix = newBuffer(sizeof arSize);
-  __gather(arReader, lPrefix, sizeof arSize);
-  const QNCBuffer& lBytes = *lPrefix;
+  QNCPrefixLoan lPrefix;
+  __gather(arReader, lPrefix.mBuffer, sizeof arSize);
+  const QNCBuffer& lBytes = *lPrefix.mBuffer;
   ClibMemcpy(&arSize, static_cast<const unsigned char*>(lBytes), sizeof arSize);
   QN_LOG_TRACE("Protocol Message to read is of '%u' bytes", arSize);
   QN_LEFT();
@@ -148,10 +169,11 @@ void QNCProtocolHelper::__read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBu
 void QNCProtocolHelper::__writeSize(QNCPointer<QNCWriter>& arWriter, unsigned int aSize) {
   QN_ENTERED();
   unsigned int lCount = 0;
-  QNCPointer<QNCBuffer> lPrefix(
-      new (std::nothrow) QNCLocalBuffer(reinterpret_cast<const unsigned char*>(&aSize), sizeof aSize),
-      QNPST_Individual, QNPAT_New);
-  arWriter->write(lPrefix, lCount);
+  QNCPrefixLoan lPrefix;
+  QNCBuffer& lBytes = *lPrefix.mBuffer;
+  lBytes.setLength(sizeof aSize);
+  ClibMemcpy(static_cast<unsigned char*>(lBytes), &aSize, sizeof aSize);
+  arWriter->write(lPrefix.mBuffer, lCount);
   QN_LOG_TRACE("Wrote '%u' bytes of Protocol Message Size of required '%u'", lCount,
                static_cast<unsigned int>(sizeof aSize));
   QN_LEFT();

@@ -40,7 +40,8 @@ enum QNEPointerAllocationType : unsigned char {
 template <class T>
 class QNCPointer {
  public:
-  QNCPointer() noexcept : mPointer(nullptr), mReferenceCount(nullptr), mSizeType(0), mAllocationType(0) {}
+  constexpr QNCPointer() noexcept
+      : mPointer(nullptr), mReferenceCount(nullptr), mSizeType(0), mAllocationType(0) {}
 
   // Takes ownership of apObject. Throws QNCNoMemoryEx "Out of Memory" (2) when apObject is null
   // or when the counter cannot be allocated.
@@ -147,6 +148,11 @@ class QNCPointer {
   // The raw address (null when empty), for down-casts and comparisons; ownership stays here.
   T* get() const noexcept { return mPointer; }
   bool isNull() const noexcept { return mPointer == nullptr; }
+
+  // True when this pointer holds the only reference to its object (false when empty). Nobody
+  // else can reach the object then, and nobody can gain a reference but by copying this pointer,
+  // so its holder may reuse the object as it likes.
+  bool isSoleOwner() const noexcept { return mReferenceCount != nullptr && mReferenceCount->isOne(); }
 
   // Drops this reference; the pointer becomes empty.
   void reset() noexcept {

@@ -19,6 +19,10 @@ class QNCReferenceCount {
 
   unsigned int get() const noexcept { return mCount.load(std::memory_order_relaxed); }
 
+  // True when the count is 1. Acquire, paired with decrement()'s release: everything the other
+  // holders did with the shared object happens before what the caller does with it next.
+  bool isOne() const noexcept { return mCount.load(std::memory_order_acquire) == 1; }
+
  private:
   std::atomic<unsigned int> mCount;
 };

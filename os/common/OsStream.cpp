@@ -109,7 +109,7 @@ int OsWriteFully(int aFd, const void* apBuffer, unsigned long aCount, QNEPipeSig
 void OsWriteAll(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCount,
                 unsigned int aTimeoutMs) {
   const char* lpBytes = static_cast<const char*>(apBuffer);
-  const long long lDeadline = nowMs() + aTimeoutMs;
+  long long lDeadline = -1;  // set at the first full descriptor: most writes never wait
   unsigned long lWritten = 0;
   for (;;) {
     unsigned long lMore = 0;
@@ -118,6 +118,7 @@ void OsWriteAll(int aFd, bool aIsSocket, const void* apBuffer, unsigned long aCo
     lWritten += lMore;
     if (lErrno == 0) return;
     if (lErrno != EAGAIN) OsThrowFdError<QNCWriteFailedEx>(lErrno, "write", aFd);
+    if (lDeadline < 0) lDeadline = nowMs() + aTimeoutMs;
     const long long lLeft = aTimeoutMs == 0 ? -1 : lDeadline - nowMs();
     if (aTimeoutMs != 0 && lLeft <= 0) {
       char lFd[QNCException::kMaxMessage / 2];

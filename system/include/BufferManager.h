@@ -22,7 +22,9 @@
 // lock: no other thread may use the manager while they run.
 //
 // Cost after warm-up: get() and reuse() each scan the bucket lengths, take one lock and move one
-// queue node; neither allocates (the queues recycle their nodes).
+// queue node; neither allocates (the queues recycle their nodes). Each call looks at the trace
+// level once: with trace masked off it runs a path that contains no trace line, so a masked-off
+// pool does not pay a test per line; with trace on every line is written, in the same order.
 
 #include "AllocatedBuffer.h"
 #include "Assert.h"
@@ -73,8 +75,15 @@ class QNCBufferManager {
   void reuse(QNCPointer<QNCBuffer>& arBuffer);
 
  private:
+  // get() and reuse() with their trace lines (acTrace) or without any.
+  template <bool acTrace>
+  void _get(unsigned int aLength, QNCPointer<QNCBuffer>& arBuffer);
+  template <bool acTrace>
+  void _reuse(QNCPointer<QNCBuffer>& arBuffer);
+
   // First bucket whose length is at least aLength. Throws QNCNotFoundEx "Cannot find a buffer
   // bucket" (8) after an error line when none is; arBucketNo is then unchanged.
+  template <bool acTrace>
   void _determineBucketNo(unsigned int aLength, unsigned int& arBucketNo) const;
 
   unsigned int _bucketBufferLength(unsigned int acIndex) const {

@@ -25,9 +25,12 @@
 //   from the reader are lost and the stream stands in the middle of a message.
 // Writing a message: one writer call for the prefix (unless acWithoutSize), one for the body; the
 // counts are traced, not checked.
+// Prefixes are read and written through a 4-byte buffer that each thread keeps and reuses while
+// no reader or writer holds on to it, so a framed message allocates only its body's buffer.
 //
-// Threads: no lock and no state that changes after construction, so any number of threads may
-// use one helper. Threads sharing one reader or writer keep whole messages apart themselves.
+// Threads: no lock, and no shared state that changes after construction (the prefix buffers are
+// per thread), so any number of threads may use one helper. Threads sharing one reader or writer keep whole
+// messages apart themselves.
 
 #include "Pointer.h"
 
