@@ -29,7 +29,8 @@ class QNCList {
   void pushBack(const T& acrElement) {
     QNNoMemoryToException([&] { mList.push_back(acrElement); });
   }
-  void pushBack(T&& arElement) {
+  // pushBack that moves arElement in instead of copying it (only the node is allocated).
+  void moveToBack(T&& arElement) {
     QNNoMemoryToException([&] { mList.push_back(std::move(arElement)); });
   }
   void pushFront(const T& acrElement) {

@@ -40,7 +40,7 @@ class QNCSpareNodes {
   void prepare(QNCPointer<QNCQueueable>& arElement, Node& arNode) const {
     if (mCount.load(std::memory_order_relaxed) != 0) return;
     arNode.emplace();
-    arNode->pushBack(std::move(arElement));
+    arNode->moveToBack(std::move(arElement));
   }
 
   // Under the owner's lock: inserts an element before aPosition of arList: the node prepared in
@@ -57,7 +57,7 @@ class QNCSpareNodes {
         return;
       }
       arNode.emplace();
-      arNode->pushBack(std::move(arElement));
+      arNode->moveToBack(std::move(arElement));
     }
     arList.splice(aPosition, *arNode, arNode->begin());
   }
