@@ -1,37 +1,45 @@
-// Hand-off of shared objects between threads through the system object's lists and
-// conditionals (enlist + signal / waitOnEmptyList + delist), against a baseline of a plain
-// std::mutex + std::deque + std::condition_variable queue of std::shared_ptr.
+// Hand-off of shared objects between threads: the system object's lists and conditionals against
+// what a user would pick instead. Contenders, each registered as HandOff/<case>/<contender>:
 //
-// A third contender takes the same locks as the system object's calls, built from the standard
-// library alone (a list with its own mutex, a separate conditional, the emptiness test under
-// both, a separate delist): the floor for this sequence of calls. Its ratio to the system object
-// (same_locks_ratio) is the cost of the library's own code; the ratio to the baseline is the
-// cost of the call sequence.
+//   ours_parts  enlist + signal / waitOnEmptyList + delist (retried on QNCNotFoundEx, which a
+//               consumer meets when another one took the element first)
+//   ours_exit   enlist + signal / delistOrExit without a time limit
+//   std_queue   std::mutex + std::deque + std::condition_variable, notify after the unlock
+//   moodycamel  moodycamel::BlockingConcurrentQueue
+//   floor       what the exit-aware take's contract requires, written with the standard library:
+//               the list's own mutex for every hand-over and take, the conditional's mutex only
+//               for a consumer that found the list empty (it counts itself before its test, and a
+//               producer that sees nobody counted takes no other lock), the exit flag read under
+//               its own mutex before each wait. The elements sit in a std::list, as the list's
+//               iterators (listBegin, listErase) require, whose nodes are recycled through a
+//               bounded spare list, as the library's are, so that a steady hand-off allocates
+//               nothing.
 //
-// Each benchmark measures the contenders in the same run, round by round: every iteration
-// hands one batch through each (Stream and PingPong rotate the order between rounds; OneThread,
-// with nothing to contend for, keeps it). The counters give each
-// contender's rate over all rounds and the ratios (system / baseline, system / same locks);
-// the benchmark's own time is the system object's.
+// Cases: stream1to1, stream2to2 (P producers hand kStreamBatch items in all to C consumers;
+// items/s), pingpong (one object back and forth between two threads through two channels; round
+// trips/s), 1thread (a thread hands items to itself: the calls' cost without contention).
+// Every element is an object made before measuring, so a hand-off costs one counted reference
+// taken by the producer and one dropped by the consumer, for every contender alike.
 //
-//   Stream/P:C   P producers hand kStreamBatch items in total to C consumers; items per second.
-//   PingPong     one object goes back and forth between two threads; round trips per second.
-//   OneThread    one thread hands items to itself: the calls' cost without contention.
-//
-// The objects exist before the clock starts and outlive the batch in both contenders, so each
-// hand-off costs one reference taken by the producer and one dropped by the consumer, and no
-// object is created or destroyed while measuring.
+// The threads of a case are started before its timed region and live for the whole benchmark;
+// each iteration releases one batch to them and is timed (manual time) from the release until
+// the last thread has finished its share. Trace logging is masked off.
 
 #include <benchmark/benchmark.h>
+#include <concurrentqueue/blockingconcurrentqueue.h>
 
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
+#include <cstddef>
+#include <cstdlib>
 #include <deque>
+#include <functional>
 #include <list>
 #include <memory>
 #include <mutex>
 #include <new>
+#include <string>
 #include <thread>
 #include <vector>
 
@@ -46,78 +54,131 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr int kStreamBatch = 20000;
-constexpr int kPingPongBatch = 2000;
+constexpr int kObjects = 1024;  // distinct objects the producers cycle through
+constexpr int kStreamBatch = 8000;
+constexpr int kPingPongBatch = 400;
+constexpr int kOneThreadBatch = 10000;
 
 class Item : public QNCQueueable {};
+using StdElement = std::shared_ptr<Item>;
+using OurElement = QNCPointer<QNCQueueable>;
 
-// --- The baseline: what a careful programmer writes with the standard library alone.
-class BaselineQueue {
+// Every contender offers two channels (0 and 1): put hands an element over, take blocks until it
+// can remove one.
+
+class StdQueue {
  public:
-  void push(const std::shared_ptr<Item>& acrItem) {
+  using Element = StdElement;
+  void put(int aChannel, const Element& acrElement) {
+    Channel& lrChannel = mChannels[aChannel];
     {
-      std::lock_guard<std::mutex> lGuard(mMutex);
-      mItems.push_back(acrItem);
+      std::lock_guard<std::mutex> lGuard(lrChannel.mMutex);
+      lrChannel.mItems.push_back(acrElement);
     }
-    mNotEmpty.notify_one();
+    lrChannel.mNotEmpty.notify_one();
   }
-
-  std::shared_ptr<Item> pop() {
-    std::unique_lock<std::mutex> lGuard(mMutex);
-    mNotEmpty.wait(lGuard, [this] { return !mItems.empty(); });
-    std::shared_ptr<Item> lItem = std::move(mItems.front());
-    mItems.pop_front();
-    return lItem;
+  Element take(int aChannel) {
+    Channel& lrChannel = mChannels[aChannel];
+    std::unique_lock<std::mutex> lGuard(lrChannel.mMutex);
+    lrChannel.mNotEmpty.wait(lGuard, [&] { return !lrChannel.mItems.empty(); });
+    Element lElement = std::move(lrChannel.mItems.front());
+    lrChannel.mItems.pop_front();
+    return lElement;
   }
 
  private:
-  std::mutex mMutex;  // guards mItems
-  std::condition_variable mNotEmpty;
-  std::deque<std::shared_ptr<Item>> mItems;
+  struct Channel {
+    std::mutex mMutex;  // guards mItems
+    std::condition_variable mNotEmpty;
+    std::deque<Element> mItems;
+  };
+  Channel mChannels[2];
 };
 
-// --- The system object's sequence of locks, with the standard library: enlist under the list's
-// mutex, then signal under the conditional's; wait under the conditional's mutex with the
-// emptiness test under the list's, then delist under the list's mutex again.
-class SameLocksQueue {
+class Moodycamel {
  public:
-  void push(const std::shared_ptr<Item>& acrItem) {
-    {
-      std::lock_guard<std::mutex> lGuard(mListMutex);
-      mItems.push_back(acrItem);
-    }
-    std::lock_guard<std::mutex> lGuard(mConditionMutex);
-    mNotEmpty.notify_one();
+  using Element = StdElement;
+  void put(int aChannel, const Element& acrElement) { mChannels[aChannel].enqueue(acrElement); }
+  Element take(int aChannel) {
+    Element lElement;
+    mChannels[aChannel].wait_dequeue(lElement);
+    return lElement;
   }
 
-  std::shared_ptr<Item> pop() {
-    for (;;) {
-      {
-        std::unique_lock<std::mutex> lGuard(mConditionMutex);
-        while (_isEmpty()) mNotEmpty.wait(lGuard);
+ private:
+  moodycamel::BlockingConcurrentQueue<Element> mChannels[2];
+};
+
+class Floor {
+ public:
+  using Element = StdElement;
+  void put(int aChannel, const Element& acrElement) {
+    Channel& lrChannel = mChannels[aChannel];
+    Element lElement(acrElement);
+    std::list<Element> lNode;
+    if (lrChannel.mSpareCount.load(std::memory_order_relaxed) == 0) lNode.push_back(std::move(lElement));
+    {
+      std::lock_guard<std::mutex> lGuard(lrChannel.mListMutex);
+      if (lNode.empty() && !lrChannel.mSpare.empty()) {
+        lrChannel.mSpare.front() = std::move(lElement);
+        lrChannel.mItems.splice(lrChannel.mItems.end(), lrChannel.mSpare, lrChannel.mSpare.begin());
+        lrChannel.mSpareCount.store(lrChannel.mSpare.size(), std::memory_order_relaxed);
+      } else {
+        if (lNode.empty()) lNode.push_back(std::move(lElement));
+        lrChannel.mItems.splice(lrChannel.mItems.end(), lNode, lNode.begin());
       }
-      std::lock_guard<std::mutex> lGuard(mListMutex);
-      if (mItems.empty()) continue;  // another consumer was first
-      std::shared_ptr<Item> lItem = mItems.front();
-      mItems.pop_front();
-      return lItem;
     }
+    if (lrChannel.mWaiters.load() != 0) {
+      { std::lock_guard<std::mutex> lGuard(lrChannel.mConditionMutex); }
+      lrChannel.mNotEmpty.notify_one();
+    }
+  }
+  Element take(int aChannel) {
+    Channel& lrChannel = mChannels[aChannel];
+    Element lElement;
+    if (_tryTake(lrChannel, lElement)) return lElement;
+    lrChannel.mWaiters.fetch_add(1);
+    std::unique_lock<std::mutex> lGuard(lrChannel.mConditionMutex);
+    while (!_tryTake(lrChannel, lElement) && !_isSetForExit()) lrChannel.mNotEmpty.wait(lGuard);
+    lGuard.unlock();
+    lrChannel.mWaiters.fetch_sub(1);
+    return lElement;
   }
 
  private:
-  bool _isEmpty() {
-    std::lock_guard<std::mutex> lGuard(mListMutex);
-    return mItems.empty();
+  static constexpr std::size_t kMaxSpare = 1024;  // the library's bound on spare nodes per list
+  struct Channel {
+    std::atomic<int> mWaiters{0};  // consumers between their registration and their unlock
+    std::mutex mConditionMutex;
+    std::condition_variable mNotEmpty;
+    std::mutex mListMutex;  // guards mItems and mSpare
+    std::list<Element> mItems;
+    std::list<Element> mSpare;  // emptied nodes for the next put
+    std::atomic<std::size_t> mSpareCount{0};
+  };
+  static bool _tryTake(Channel& arChannel, Element& arElement) {
+    std::list<Element> lFreed;
+    std::lock_guard<std::mutex> lGuard(arChannel.mListMutex);
+    if (arChannel.mItems.empty()) return false;
+    arElement = std::move(arChannel.mItems.front());
+    if (arChannel.mSpare.size() < kMaxSpare) {
+      arChannel.mSpare.splice(arChannel.mSpare.begin(), arChannel.mItems, arChannel.mItems.begin());
+      arChannel.mSpareCount.store(arChannel.mSpare.size(), std::memory_order_relaxed);
+    } else {
+      lFreed.splice(lFreed.end(), arChannel.mItems, arChannel.mItems.begin());
+    }
+    return true;
   }
-
-  std::mutex mConditionMutex;
-  std::condition_variable mNotEmpty;
-  std::mutex mListMutex;  // guards mItems
-  std::list<std::shared_ptr<Item>> mItems;
+  bool _isSetForExit() {
+    std::lock_guard<std::mutex> lGuard(mExitMutex);
+    return mExitFlag;
+  }
+  Channel mChannels[2];
+  std::mutex mExitMutex;  // guards mExitFlag
+  bool mExitFlag = false;
 };
 
-// --- The system object with the tables the hand-offs use: lists 0 and 1, each paired with the
-// conditional of the same number.
+// The system object with lists 0 and 1, each paired with the conditional of the same number.
 class HandOffSystem : public QNCSystem {
  public:
   HandOffSystem() {
@@ -129,223 +190,218 @@ class HandOffSystem : public QNCSystem {
   void setCommandLineArgumentDesc() override {}
   void parseConfigFile(QNCString&) override { throw QNCNotImplementedEx("no config file", 0); }
   void displayHelp() override {}
+};
 
-  void handOff(unsigned int aNumber, const QNCPointer<QNCQueueable>& acrItem) {
-    enlist(aNumber, acrItem);
-    signal(aNumber);
+class OursParts {
+ public:
+  using Element = OurElement;
+  void put(int aChannel, const Element& acrElement) {
+    mSystem.enlist(aChannel, acrElement);
+    mSystem.signal(aChannel);
   }
-
-  // Blocks until list aNumber holds an element and takes it (another consumer may be first).
-  QNCPointer<QNCQueueable> take(unsigned int aNumber) {
+  Element take(int aChannel) {
     for (;;) {
-      waitOnEmptyList(aNumber, aNumber);
+      mSystem.waitOnEmptyList(aChannel, aChannel);
       try {
-        return delist(aNumber);
+        return mSystem.delist(aChannel);
       } catch (const QNCNotFoundEx&) {
       }
     }
   }
+
+ private:
+  HandOffSystem mSystem;
 };
 
-// Starts the threads, releases them together and returns the seconds from the release until
-// the last of them has finished its share.
-template <class Body>
-double runThreads(int aThreads, Body aBody) {
-  std::atomic<bool> lGo{false};
-  std::vector<Clock::time_point> lEnds(aThreads);
-  std::vector<std::thread> lThreads;
-  for (int lIndex = 0; lIndex < aThreads; ++lIndex) {
-    lThreads.emplace_back([&, lIndex] {
-      while (!lGo.load(std::memory_order_acquire)) std::this_thread::yield();
-      aBody(lIndex);
-      lEnds[lIndex] = Clock::now();
-    });
+class OursExit {
+ public:
+  using Element = OurElement;
+  void put(int aChannel, const Element& acrElement) {
+    mSystem.enlist(aChannel, acrElement);
+    mSystem.signal(aChannel);
   }
-  const Clock::time_point lStart = Clock::now();
-  lGo.store(true, std::memory_order_release);
-  for (auto& lThread : lThreads) lThread.join();
-  Clock::time_point lEnd = lStart;
-  for (const auto& lThreadEnd : lEnds) lEnd = std::max(lEnd, lThreadEnd);
-  return std::chrono::duration<double>(lEnd - lStart).count();
+  Element take(int aChannel) {
+    Element lElement;
+    if (mSystem.delistOrExit(aChannel, aChannel, 0, lElement) != QNWS_Ready) std::abort();
+    return lElement;
+  }
+
+ private:
+  HandOffSystem mSystem;
+};
+
+template <class Element>
+Element makeElement();
+template <>
+StdElement makeElement<StdElement>() {
+  return std::make_shared<Item>();
+}
+template <>
+OurElement makeElement<OurElement>() {
+  return OurElement(new (std::nothrow) Item);
 }
 
-// Producers 0..P-1 hand their share and then one stop marker; consumers end at their first
-// marker, so every item is taken before the last consumer ends.
-template <class Queue>
-double streamStandard(int aProducers, int aConsumers, const std::vector<std::shared_ptr<Item>>& acrItems,
-                      const std::shared_ptr<Item>& acrStop) {
-  Queue lQueue;
-  const int lShare = kStreamBatch / aProducers;
-  return runThreads(aProducers + aConsumers, [&](int aIndex) {
-    if (aIndex < aProducers) {
-      for (int lItem = aIndex * lShare; lItem < (aIndex + 1) * lShare; ++lItem) lQueue.push(acrItems[lItem]);
-      lQueue.push(acrStop);
-    } else {
-      while (lQueue.pop() != acrStop) {
-      }
+// The contender and its objects live for the whole program (never destroyed: the system object's
+// destructor would log after the benchmarks), so every run starts from the same warm state; each
+// run takes every element it hands over.
+template <class Contender>
+Contender& contender() {
+  static Contender* const spContender = new Contender;
+  return *spContender;
+}
+template <class Contender>
+const std::vector<typename Contender::Element>& objects() {
+  static const auto* const spObjects = [] {
+    auto* lpObjects = new std::vector<typename Contender::Element>;
+    for (int lIndex = 0; lIndex < kObjects; ++lIndex)
+      lpObjects->push_back(makeElement<typename Contender::Element>());
+    return lpObjects;
+  }();
+  return *spObjects;
+}
+
+// Threads started once, before the timed region; runBatch() releases them together and returns
+// the seconds from the release until the last of them has finished its share.
+class Crew {
+ public:
+  Crew(int aThreads, std::function<void(int)> aShare) : mShare(std::move(aShare)), mEnds(aThreads) {
+    for (int lIndex = 0; lIndex < aThreads; ++lIndex) mThreads.emplace_back([this, lIndex] { _run(lIndex); });
+  }
+  ~Crew() {
+    {
+      std::lock_guard<std::mutex> lGuard(mMutex);
+      mStop = true;
     }
-  });
-}
-
-double streamSystem(HandOffSystem& arSystem, int aProducers, int aConsumers,
-                    const std::vector<QNCPointer<QNCQueueable>>& acrItems,
-                    const QNCPointer<QNCQueueable>& acrStop) {
-  const int lShare = kStreamBatch / aProducers;
-  return runThreads(aProducers + aConsumers, [&](int aIndex) {
-    if (aIndex < aProducers) {
-      for (int lItem = aIndex * lShare; lItem < (aIndex + 1) * lShare; ++lItem)
-        arSystem.handOff(0, acrItems[lItem]);
-      arSystem.handOff(0, acrStop);
-    } else {
-      while (arSystem.take(0).get() != acrStop.get()) {
-      }
-    }
-  });
-}
-
-void reportRates(benchmark::State& arState, double aBaselineSeconds, double aSystemSeconds, double aCount) {
-  arState.counters["base_per_s"] = aCount / aBaselineSeconds;
-  arState.counters["qn_per_s"] = aCount / aSystemSeconds;
-  arState.counters["ratio"] = aBaselineSeconds / aSystemSeconds;
-}
-
-void reportSameLocks(benchmark::State& arState, double aSameLocksSeconds, double aSystemSeconds,
-                     double aCount) {
-  arState.counters["same_locks_per_s"] = aCount / aSameLocksSeconds;
-  arState.counters["same_locks_ratio"] = aSameLocksSeconds / aSystemSeconds;
-}
-
-void BM_Stream(benchmark::State& arState) {
-  qnbench::setTraceLogging(false);
-  const int lProducers = static_cast<int>(arState.range(0));
-  const int lConsumers = static_cast<int>(arState.range(1));
-  std::vector<std::shared_ptr<Item>> lBaselineItems;
-  std::vector<QNCPointer<QNCQueueable>> lSystemItems;
-  for (int lIndex = 0; lIndex < kStreamBatch; ++lIndex) {
-    lBaselineItems.push_back(std::make_shared<Item>());
-    lSystemItems.emplace_back(new (std::nothrow) Item);
+    mGo.notify_all();
+    for (auto& lThread : mThreads) lThread.join();
   }
-  const auto lBaselineStop = std::make_shared<Item>();
-  const QNCPointer<QNCQueueable> lSystemStop(new (std::nothrow) Item);
-  HandOffSystem lSystem;
-  double lSeconds[3] = {0, 0, 0};  // baseline, same locks, system object
-  int lFirst = 0;
-  for (auto _ : arState) {
-    double lRound = 0;
-    for (int lTurn = 0; lTurn < 3; ++lTurn) {
-      const int lContender = (lFirst + lTurn) % 3;
-      if (lContender == 0) {
-        lSeconds[0] += streamStandard<BaselineQueue>(lProducers, lConsumers, lBaselineItems, lBaselineStop);
-      } else if (lContender == 1) {
-        lSeconds[1] += streamStandard<SameLocksQueue>(lProducers, lConsumers, lBaselineItems, lBaselineStop);
-      } else {
-        lRound = streamSystem(lSystem, lProducers, lConsumers, lSystemItems, lSystemStop);
-        lSeconds[2] += lRound;
-      }
-    }
-    arState.SetIterationTime(lRound);
-    lFirst = (lFirst + 1) % 3;
-  }
-  const double lItems = static_cast<double>(arState.iterations()) * kStreamBatch;
-  reportRates(arState, lSeconds[0], lSeconds[2], lItems);
-  reportSameLocks(arState, lSeconds[1], lSeconds[2], lItems);
-  qnbench::setTraceLogging(true);
-}
-BENCHMARK(BM_Stream)
-    ->ArgNames({"producers", "consumers"})
-    ->Args({1, 1})
-    ->Args({2, 2})
-    ->UseManualTime()
-    ->Iterations(40);
-
-void BM_PingPong(benchmark::State& arState) {
-  qnbench::setTraceLogging(false);
-  const auto lBaselineBall = std::make_shared<Item>();
-  const QNCPointer<QNCQueueable> lSystemBall(new (std::nothrow) Item);
-  HandOffSystem lSystem;
-  auto lBaseline = [&] {
-    BaselineQueue lThere;
-    BaselineQueue lBack;
-    return runThreads(2, [&](int aIndex) {
-      for (int lTrip = 0; lTrip < kPingPongBatch; ++lTrip) {
-        if (aIndex == 0) {
-          lThere.push(lBaselineBall);
-          benchmark::DoNotOptimize(lBack.pop());
-        } else {
-          lBack.push(lThere.pop());
-        }
-      }
-    });
-  };
-  auto lQn = [&] {
-    return runThreads(2, [&](int aIndex) {
-      for (int lTrip = 0; lTrip < kPingPongBatch; ++lTrip) {
-        if (aIndex == 0) {
-          lSystem.handOff(1, lSystemBall);
-          benchmark::DoNotOptimize(lSystem.take(0));
-        } else {
-          lSystem.handOff(0, lSystem.take(1));
-        }
-      }
-    });
-  };
-  double lBaselineSeconds = 0;
-  double lSystemSeconds = 0;
-  bool lBaselineFirst = true;
-  for (auto _ : arState) {
-    if (lBaselineFirst) lBaselineSeconds += lBaseline();
-    const double lRound = lQn();
-    if (!lBaselineFirst) lBaselineSeconds += lBaseline();
-    lSystemSeconds += lRound;
-    arState.SetIterationTime(lRound);
-    lBaselineFirst = !lBaselineFirst;
-  }
-  reportRates(arState, lBaselineSeconds, lSystemSeconds,
-              static_cast<double>(arState.iterations()) * kPingPongBatch);
-  qnbench::setTraceLogging(true);
-}
-BENCHMARK(BM_PingPong)->UseManualTime()->Iterations(20);
-
-// One thread hands items to itself: the cost of the calls without any contention, which shows how
-// much of the stream's gap is the number of locks per item rather than the hand-off between cores.
-void BM_OneThread(benchmark::State& arState) {
-  qnbench::setTraceLogging(false);
-  constexpr int kBatch = 10000;
-  HandOffSystem lSystem;
-  BaselineQueue lBaseline;
-  SameLocksQueue lSameLocks;
-  const QNCPointer<QNCQueueable> lSystemItem(new (std::nothrow) Item);
-  const auto lBaselineItem = std::make_shared<Item>();
-  auto lTime = [](auto aBody) {
+  double runBatch() {
+    std::unique_lock<std::mutex> lGuard(mMutex);
+    mFinished = 0;
+    ++mRound;
     const Clock::time_point lStart = Clock::now();
-    for (int lItem = 0; lItem < kBatch; ++lItem) aBody();
-    return std::chrono::duration<double>(Clock::now() - lStart).count();
-  };
-  double lBaselineSeconds = 0;
-  double lSameLocksSeconds = 0;
-  double lSystemSeconds = 0;
-  for (auto _ : arState) {
-    lBaselineSeconds += lTime([&] {
-      lBaseline.push(lBaselineItem);
-      benchmark::DoNotOptimize(lBaseline.pop());
-    });
-    lSameLocksSeconds += lTime([&] {
-      lSameLocks.push(lBaselineItem);
-      benchmark::DoNotOptimize(lSameLocks.pop());
-    });
-    const double lRound = lTime([&] {
-      lSystem.handOff(0, lSystemItem);
-      benchmark::DoNotOptimize(lSystem.take(0));
-    });
-    lSystemSeconds += lRound;
-    arState.SetIterationTime(lRound);
+    mGo.notify_all();
+    mDone.wait(lGuard, [this] { return mFinished == static_cast<int>(mThreads.size()); });
+    Clock::time_point lEnd = lStart;
+    for (const auto& lThreadEnd : mEnds) lEnd = std::max(lEnd, lThreadEnd);
+    return std::chrono::duration<double>(lEnd - lStart).count();
   }
-  const double lItems = static_cast<double>(arState.iterations()) * kBatch;
-  reportRates(arState, lBaselineSeconds, lSystemSeconds, lItems);
-  reportSameLocks(arState, lSameLocksSeconds, lSystemSeconds, lItems);
+
+ private:
+  void _run(int aIndex) {
+    long lSeen = 0;
+    for (;;) {
+      {
+        std::unique_lock<std::mutex> lGuard(mMutex);
+        mGo.wait(lGuard, [&] { return mStop || mRound != lSeen; });
+        if (mStop) return;
+        lSeen = mRound;
+      }
+      mShare(aIndex);
+      std::lock_guard<std::mutex> lGuard(mMutex);
+      mEnds[aIndex] = Clock::now();
+      if (++mFinished == static_cast<int>(mThreads.size())) mDone.notify_one();
+    }
+  }
+
+  std::function<void(int)> mShare;
+  std::mutex mMutex;  // guards mRound, mFinished, mStop, mEnds
+  std::condition_variable mGo;
+  std::condition_variable mDone;
+  long mRound = 0;
+  int mFinished = 0;
+  bool mStop = false;
+  std::vector<Clock::time_point> mEnds;
+  std::vector<std::thread> mThreads;
+};
+
+void runCrew(benchmark::State& arState, int aThreads, const std::function<void(int)>& acrShare, int aBatch) {
+  qnbench::setTraceLogging(false);
+  Crew lCrew(aThreads, acrShare);
+  for (auto _ : arState) arState.SetIterationTime(lCrew.runBatch());
+  arState.SetItemsProcessed(arState.iterations() * aBatch);
   qnbench::setTraceLogging(true);
 }
-BENCHMARK(BM_OneThread)->UseManualTime()->Iterations(200);
+
+// Threads 0..P-1 produce kStreamBatch / P items each; threads P..P+C-1 take kStreamBatch / C each.
+template <class Contender>
+void stream(benchmark::State& arState, int aProducers, int aConsumers) {
+  Contender& lrContender = contender<Contender>();
+  const auto& lrObjects = objects<Contender>();
+  runCrew(
+      arState, aProducers + aConsumers,
+      [&, aProducers, aConsumers](int aIndex) {
+        if (aIndex < aProducers) {
+          const int lShare = kStreamBatch / aProducers;
+          for (int lItem = aIndex * lShare; lItem < (aIndex + 1) * lShare; ++lItem)
+            lrContender.put(0, lrObjects[lItem % kObjects]);
+        } else {
+          for (int lItem = 0; lItem < kStreamBatch / aConsumers; ++lItem)
+            benchmark::DoNotOptimize(lrContender.take(0));
+        }
+      },
+      kStreamBatch);
+}
+
+template <class Contender>
+void pingPong(benchmark::State& arState) {
+  Contender& lrContender = contender<Contender>();
+  const auto& lrBall = objects<Contender>()[0];
+  runCrew(
+      arState, 2,
+      [&](int aIndex) {
+        for (int lTrip = 0; lTrip < kPingPongBatch; ++lTrip) {
+          if (aIndex == 0) {
+            lrContender.put(1, lrBall);
+            benchmark::DoNotOptimize(lrContender.take(0));
+          } else {
+            lrContender.put(0, lrContender.take(1));
+          }
+        }
+      },
+      kPingPongBatch);
+}
+
+template <class Contender>
+void oneThread(benchmark::State& arState) {
+  qnbench::setTraceLogging(false);
+  Contender& lrContender = contender<Contender>();
+  const auto& lrObjects = objects<Contender>();
+  for (auto _ : arState) {
+    const Clock::time_point lStart = Clock::now();
+    for (int lItem = 0; lItem < kOneThreadBatch; ++lItem) {
+      lrContender.put(0, lrObjects[lItem % kObjects]);
+      benchmark::DoNotOptimize(lrContender.take(0));
+    }
+    arState.SetIterationTime(std::chrono::duration<double>(Clock::now() - lStart).count());
+  }
+  arState.SetItemsProcessed(arState.iterations() * kOneThreadBatch);
+  qnbench::setTraceLogging(true);
+}
+
+template <class Contender>
+void registerContender(const std::string& acrName) {
+  const std::string lPrefix = "HandOff/";
+  const std::pair<const char*, std::function<void(benchmark::State&)>> lCases[] = {
+      {"stream1to1", [](benchmark::State& arState) { stream<Contender>(arState, 1, 1); }},
+      {"stream2to2", [](benchmark::State& arState) { stream<Contender>(arState, 2, 2); }},
+      {"pingpong", [](benchmark::State& arState) { pingPong<Contender>(arState); }},
+      {"1thread", [](benchmark::State& arState) { oneThread<Contender>(arState); }},
+  };
+  for (const auto& lrCase : lCases)
+    benchmark::RegisterBenchmark((lPrefix + lrCase.first + "/" + acrName).c_str(), lrCase.second)
+        ->UseManualTime()
+        ->MinTime(0.1);
+}
+
+const bool kRegistered = [] {
+  registerContender<OursParts>("ours_parts");
+  registerContender<OursExit>("ours_exit");
+  registerContender<StdQueue>("std_queue");
+  registerContender<Moodycamel>("moodycamel");
+  registerContender<Floor>("floor");
+  return true;
+}();
 
 }  // namespace
 

@@ -15,25 +15,25 @@ QNCPointer<QNCQueueable> QNCSynchQueue::dequeue() {
 }
 
 bool QNCSynchQueue::tryDequeue(QNCPointer<QNCQueueable>& arElement) {
-  QNCList<QNCPointer<QNCQueueable>> lTaken;
-  {
-    QNCMutexLocker lGuard(mMutex);
-    if (mElements.isEmpty()) return false;
-    // Unlinking the node costs neither an allocation nor counter traffic under the lock; the
-    // node is freed when lTaken goes, after the lock.
-    lTaken.spliceBack(mElements, mElements.begin());
-  }
-  arElement = std::move(lTaken.front());
+  arElement.reset();
+  QNCSpareNodes::Node lFreed;
+  QNCMutexLocker lGuard(mMutex);
+  if (mElements.isEmpty()) return false;
+  // Moving the element out costs no counter traffic under the lock; its node stays as a spare
+  // (or, beyond the spares' bound, is freed with lFreed after the lock).
+  mSpares.take(mElements, mElements.begin(), arElement, lFreed);
   return true;
 }
 
 void QNCSynchQueue::enqueue(const QNCPointer<QNCQueueable>& acrElement) {
-  // The node is allocated before the lock: a failed allocation leaves the queue untouched, and
-  // other threads do not wait behind the allocator.
-  QNCList<QNCPointer<QNCQueueable>> lNode;
-  lNode.pushBack(acrElement);
+  // The counter is taken, and a node allocated when no spare is at hand, before the lock: a
+  // failed allocation leaves the queue untouched, and other threads do not wait behind the
+  // allocator.
+  QNCPointer<QNCQueueable> lElement(acrElement);
+  QNCSpareNodes::Node lNode;
+  mSpares.prepare(lElement, lNode);
   QNCMutexLocker lGuard(mMutex);
-  mElements.spliceBack(lNode, lNode.begin());
+  mSpares.insert(mElements, mElements.end(), lNode, lElement);
 }
 
 bool QNCSynchQueue::isEmpty() {

@@ -5,8 +5,11 @@
 //
 // The tests run under the conditional's lock, and signal() and makeThreadsToExit() pass through
 // that lock before they wake waiters, so a change made before either cannot fall between a test
-// and the wait and be lost. Lock order: the conditional's lock, then inside it whatever the tests
-// take (a list's or queue's lock, mExitLock); never the reverse.
+// and the wait and be lost. signal() skips the lock and the wake-up only when no thread is
+// between the conditional's lock() and unlock(): the waiter counts itself in lock(), before its
+// first test, so none can then be between a test that missed the change and its wait
+// (Conditional.h). Lock order: the conditional's lock, then inside it whatever the tests take (a
+// list's or queue's lock, mExitLock); never the reverse.
 
 #include <chrono>
 
@@ -28,8 +31,10 @@ QNEWaitStatus QNWaitOnConditional(QNCConditional& arConditional, const Ready& ac
     if (QNIsLogLevelOn(QNLL_Trace))
       PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, apFunction, __FILE__, "%s", apText);
   };
-  const auto lDeadline =
-      std::chrono::steady_clock::now() + std::chrono::milliseconds(aLimitMs < 0 ? 0 : aLimitMs);
+  // Without a limit the clock is not read at all.
+  const auto lDeadline = aLimitMs < 0
+                             ? std::chrono::steady_clock::time_point()
+                             : std::chrono::steady_clock::now() + std::chrono::milliseconds(aLimitMs);
   QNEWaitStatus lStatus = QNWS_Ready;
   lTrace("Locking the wait conditional");
   arConditional.lock();

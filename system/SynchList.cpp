@@ -11,47 +11,52 @@ QNCSynchList::~QNCSynchList() {
   mMutex.reset();
 }
 
-// The node is allocated before the lock: a failed allocation leaves the list untouched, and
-// other threads do not wait behind the allocator.
+// The element's counter is taken and a node allocated (when no spare node is at hand) before the
+// lock: a failed allocation leaves the list untouched, and other threads do not wait behind the
+// allocator. Declared before the guard, lElement and lNode are released after the unlock.
 void QNCSynchList::enlist(const QNCPointer<QNCQueueable>& acrElement) {
-  Elements lNode;
-  lNode.pushBack(acrElement);
+  QNCPointer<QNCQueueable> lElement(acrElement);
+  QNCSpareNodes::Node lNode;
+  mSpares.prepare(lElement, lNode);
   QNCMutexLocker lGuard(*mMutex);
-  mList.spliceBack(lNode, lNode.begin());
+  mSpares.insert(mList, mList.end(), lNode, lElement);
 }
 
 void QNCSynchList::enlistFront(const QNCPointer<QNCQueueable>& acrElement) {
+  QNCPointer<QNCQueueable> lElement(acrElement);
+  QNCSpareNodes::Node lNode;
+  mSpares.prepare(lElement, lNode);
   QNCMutexLocker lGuard(*mMutex);
-  mList.pushFront(acrElement);
+  mSpares.insert(mList, mList.begin(), lNode, lElement);
 }
 
-// The removed node is unlinked into a local list under the lock (no allocation, no counter
-// traffic) and its element moved out after the lock; the node is freed outside the lock too.
 QNCPointer<QNCQueueable> QNCSynchList::delist() {
   QNCPointer<QNCQueueable> lHead;
   if (!tryDelist(lHead)) throw QNCNotFoundEx("Not Found", 8);
   return lHead;
 }
 
+// arElement's former object is released before the lock; the head is moved into it under the
+// lock (no counter traffic) and its node kept as a spare (one beyond the spares' bound is freed
+// after the lock).
 bool QNCSynchList::tryDelist(QNCPointer<QNCQueueable>& arElement) {
-  Elements lTaken;
-  {
-    QNCMutexLocker lGuard(*mMutex);
-    if (mList.isEmpty()) return false;
-    lTaken.spliceBack(mList, mList.begin());
-  }
-  arElement = std::move(lTaken.front());
+  arElement.reset();
+  QNCSpareNodes::Node lFreed;
+  QNCMutexLocker lGuard(*mMutex);
+  if (mList.isEmpty()) return false;
+  mSpares.take(mList, mList.begin(), arElement, lFreed);
   return true;
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::delistBack() {
-  Elements lTaken;
+  QNCPointer<QNCQueueable> lTail;
+  QNCSpareNodes::Node lFreed;
   {
     QNCMutexLocker lGuard(*mMutex);
     if (mList.isEmpty()) throw QNCNotFoundEx("Not Found", 8);
-    lTaken.spliceBack(mList, std::prev(mList.end()));
+    mSpares.take(mList, std::prev(mList.end()), lTail, lFreed);
   }
-  return std::move(lTaken.front());
+  return lTail;
 }
 
 QNCPointer<QNCQueueable> QNCSynchList::front() {
@@ -80,10 +85,11 @@ bool QNCSynchList::isEmpty() {
 }
 
 void QNCSynchList::erase(Elements::iterator& arPosition) {
-  Elements lTaken;
+  QNCPointer<QNCQueueable> lErased;
+  QNCSpareNodes::Node lFreed;
   QNCMutexLocker lGuard(*mMutex);
   const Elements::iterator lNext = std::next(arPosition);
-  lTaken.spliceBack(mList, arPosition);
+  mSpares.take(mList, arPosition, lErased, lFreed);
   arPosition = lNext;
-  // lGuard is released before lTaken, so the erased element is destroyed outside the lock.
+  // lGuard is released before lErased, so the erased element is destroyed outside the lock.
 }

@@ -24,14 +24,21 @@ void QNCSystem::signal(unsigned int acConditionNo) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
   QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
-  // A waiter that has found its queue or list empty holds this lock until it is inside the wait.
-  // Passing through the lock therefore orders this signal after that waiter's wait has begun,
-  // so it cannot fall between the waiter's test and its wait and be lost. The signal itself is
-  // given after the unlock: a thread woken while the lock is still held would only block again
-  // on it, which costs a second sleep and wake-up per hand-off.
-  lConditional.lock();
-  lConditional.unlock();
-  lConditional.signal();
+  // Nobody between lock() and unlock() of the conditional: no thread waits, and none has tested
+  // its list or queue before the caller's enlist/enqueue (a waiter counts itself before its
+  // test, and that change was made before this read; Conditional.h gives the ordering), so a
+  // later waiter will find the element and the wake-up can be skipped. With the trace level on,
+  // the signal passes the lock every time, as it always did.
+  if (lConditional.hasWaiters() || QNIsLogLevelOn(QNLL_Trace)) {
+    // A waiter that has found its queue or list empty holds this lock until it is inside the
+    // wait. Passing through the lock therefore orders this signal after that waiter's wait has
+    // begun, so it cannot fall between the waiter's test and its wait and be lost. The signal
+    // itself is given after the unlock: a thread woken while the lock is still held would only
+    // block again on it, which costs a second sleep and wake-up per hand-off.
+    lConditional.lock();
+    lConditional.unlock();
+    lConditional.signal();
+  }
   QN_LEFT();
 }
 

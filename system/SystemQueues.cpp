@@ -10,17 +10,22 @@
 
 namespace {
 // Traces "Left" for the service it was made in when that service returns, and not when an
-// exception leaves it (as the services always did).
+// exception leaves it (as the services always did). With the trace level off at entry it does
+// nothing at all: asking for the exceptions in flight costs two calls into the runtime per
+// service, a good part of a hand-off's cost.
 class QNCLeftTrace {
  public:
-  QNCLeftTrace(int aLine, const char* apFunction) : mLine(aLine), mpFunction(apFunction) {}
+  QNCLeftTrace(int aLine, const char* apFunction)
+      : mUncaught(QNIsLogLevelOn(QNLL_Trace) ? std::uncaught_exceptions() : -1),
+        mLine(aLine),
+        mpFunction(apFunction) {}
   ~QNCLeftTrace() {
-    if (std::uncaught_exceptions() == mUncaught && QNIsLogLevelOn(QNLL_Trace))
+    if (mUncaught >= 0 && std::uncaught_exceptions() == mUncaught && QNIsLogLevelOn(QNLL_Trace))
       PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", mLine, mpFunction, __FILE__, "%s", "Left");
   }
 
  private:
-  const int mUncaught = std::uncaught_exceptions();
+  const int mUncaught;  // exceptions in flight at entry; -1: the trace level was off
   const int mLine;
   const char* mpFunction;
 };
@@ -185,9 +190,9 @@ QNEWaitStatus QNCSystem::delistOrExit(unsigned int acConditionNo, unsigned int a
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
   QN_NUMBERED_AFTER_ENTRY(acListNo, mLists);
-  arElement.reset();
-  // The busy case first: one pass through the list's lock. Otherwise the take is the test itself,
-  // made under the conditional's lock, so no other consumer comes between the test and the take.
+  // tryDelist releases arElement's former object before it locks. The busy case first: one pass
+  // through the list's lock. Otherwise the take is the test itself, made under the conditional's
+  // lock, so no other consumer comes between the test and the take.
   if (lrElement.tryDelist(arElement)) return QNWS_Ready;
   return QNWaitOnConditional(
       *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDelist(arElement); },
@@ -200,7 +205,7 @@ QNEWaitStatus QNCSystem::dequeueOrExit(unsigned int acConditionNo, unsigned int 
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
   QN_NUMBERED_AFTER_ENTRY(acQueueNo, mQueues);
-  arElement.reset();
+  arElement.reset();  // tryDequeue does it too, but a derived queue may override it
   if (lrElement.tryDequeue(arElement)) return QNWS_Ready;
   return QNWaitOnConditional(
       *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDequeue(arElement); },

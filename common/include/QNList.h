@@ -8,6 +8,7 @@
 
 #include <list>
 #include <new>
+#include <utility>
 
 #include "QNException.h"
 
@@ -27,6 +28,10 @@ class QNCList {
 
   void pushBack(const T& acrElement) {
     QNNoMemoryToException([&] { mList.push_back(acrElement); });
+  }
+  // pushBack that moves arElement in instead of copying it (only the node is allocated).
+  void moveToBack(T&& arElement) {
+    QNNoMemoryToException([&] { mList.push_back(std::move(arElement)); });
   }
   void pushFront(const T& acrElement) {
     QNNoMemoryToException([&] { mList.push_front(acrElement); });
@@ -75,6 +80,11 @@ class QNCList {
   // Moves the element at aPosition of arOther to the end of this list without allocating.
   void spliceBack(QNCList& arOther, iterator aPosition) noexcept {
     mList.splice(mList.end(), arOther.mList, aPosition);
+  }
+  // The same, to the place before aBefore. Iterators to the moved element stay valid and now
+  // designate it in this list.
+  void splice(iterator aBefore, QNCList& arOther, iterator aPosition) noexcept {
+    mList.splice(aBefore, arOther.mList, aPosition);
   }
 
  private:

@@ -1,9 +1,11 @@
 #pragma once
 // QNCSynchQueue: a first-in first-out queue of shared objects that any number of threads may use
 // at the same time. Every operation holds the queue's own mutex for its own duration only and
-// never calls out while holding it: nodes are allocated before the lock is taken, and elements
-// that leave the queue are released after it is given up, so an element's destructor may use
-// this queue again.
+// never calls out while holding it: elements that leave the queue are released after it is given
+// up, so an element's destructor may use this queue again. The node of a dequeued element is
+// kept as a spare (QNCSpareNodes, bounded) and reused by the next enqueue, so a queue in steady
+// use allocates nothing; a node is allocated only when no spare is at hand, before the lock (under
+// it only when another thread took the last spare meanwhile).
 //
 // The system object reaches a queue only through these virtual operations, in this slot order:
 // front, dequeue, enqueue, isEmpty, clear. A derived queue may override them (for instance to
@@ -16,6 +18,7 @@
 #include "Pointer.h"
 #include "QNList.h"
 #include "Queueable.h"
+#include "SpareNodes.h"
 
 class QNCSynchQueue {
  public:
@@ -45,11 +48,13 @@ class QNCSynchQueue {
   // given up.
   virtual void clear();
 
-  // dequeue() without the exception: false (arElement unchanged) when the queue is empty. One
-  // pass through the lock, no allocation; arElement's former object is released after the lock.
+  // dequeue() without the exception: false (arElement then empty) when the queue is empty. One
+  // pass through the lock, no allocation; arElement's former object is released before the lock
+  // is taken.
   virtual bool tryDequeue(QNCPointer<QNCQueueable>& arElement);
 
  private:
-  QNCMutex mMutex;  // guards mElements
+  QNCMutex mMutex;  // guards mElements and mSpares
   QNCList<QNCPointer<QNCQueueable>> mElements;
+  QNCSpareNodes mSpares;
 };

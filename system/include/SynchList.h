@@ -3,11 +3,17 @@
 // the same time. A plain class: the system object's list services (QNCSystem::enlist, delist,
 // ...) delegate to the operations below.
 //
-// Locking: mMutex guards mList. Every element operation holds it for its own duration only and
-// never calls out while holding it: a new node is allocated before the lock is taken, and an
-// element that leaves the list is released after the lock is given up, so an element's
-// destructor may use this list again. Elements are handed out as new pointers that share the
-// object, so a caller may keep using a delisted object while others change the list.
+// Locking: mMutex guards mList and mSpares. Every element operation holds it for its own
+// duration only and never calls out while holding it: an element that leaves the list is
+// released after the lock is given up, so an element's destructor may use this list again.
+// Elements are handed out as new pointers that share the object, so a caller may keep using a
+// delisted object while others change the list.
+//
+// Nodes: a node that leaves the list by delist, delistBack, tryDelist or erase is kept as a spare
+// (up to QNCSpareNodes::kMaxNodes of them, holding no element) and reused by the next enlist or
+// enlistFront, so a list in steady use allocates nothing. A node is allocated only when no spare
+// is at hand, before the lock is taken (under it only when another thread took the last spare
+// meanwhile).
 //
 // begin(), end() and erase() are for a walk of the list. begin() and end() take no lock; the
 // walker must make sure that no other thread changes the list until the walk is over (erase()
@@ -19,6 +25,7 @@
 #include "Pointer.h"
 #include "QNList.h"
 #include "Queueable.h"
+#include "SpareNodes.h"
 
 class QNCSynchList {
  public:
@@ -39,8 +46,9 @@ class QNCSynchList {
   // "Not Found" (8) when the list is empty; the list is then unchanged and its lock released.
   QNCPointer<QNCQueueable> delist();
   QNCPointer<QNCQueueable> delistBack();
-  // delist() without the exception: false (arElement unchanged) when the list is empty. One pass
-  // through the lock and no allocation; arElement's former object is released after the lock.
+  // delist() without the exception: false (arElement then empty) when the list is empty. One
+  // pass through the lock and no allocation; arElement's former object is released before the
+  // lock is taken.
   bool tryDelist(QNCPointer<QNCQueueable>& arElement);
 
   // A copy of the head element, made under the lock. Throws QNCNotFoundEx "Not Found" (8) when
@@ -63,5 +71,6 @@ class QNCSynchList {
 
  private:
   Elements mList;
-  QNCPointer<QNCMutex> mMutex;  // guards mList
+  QNCPointer<QNCMutex> mMutex;  // guards mList and mSpares
+  QNCSpareNodes mSpares;
 };

@@ -7,6 +7,20 @@
 // Any thread may use it. signal() may be called with or without the mutex held; a signal given
 // while nobody waits is lost, not remembered for a later wait. Timed waits measure against the
 // monotonic clock. None of the operations logs.
+//
+// Waiters are counted: every thread between its lock() and its unlock() is one, from before it
+// holds the mutex (so from before its first test of the condition) until it has given the
+// mutex up, whether it runs, waits for the mutex or sleeps in wait(). hasWaiters() lets a thread
+// that has just made the condition true skip the wake-up when nobody can need it. That is safe
+// when the change is ordered before hasWaiters() and after any test that a waiter made
+// (Dekker's pattern): a waiter counts itself (sequentially consistent) before its test, and the
+// changer reads the count (sequentially consistent) after its change. If the change and the
+// test are made under one lock (this conditional's, or a list's), a test that missed the change
+// came first in that lock's order, so its count is visible to the changer's read; the same holds
+// for a condition kept in sequentially consistent atomics. If the read gives 0, every later
+// waiter tests after the change and sees it.
+
+#include <atomic>
 
 #include "Mutex.h"
 #include "Os.h"
@@ -20,9 +34,24 @@ class QNCConditional {
   // Nobody may be waiting any more.
   virtual ~QNCConditional() { OsDestroyConditional(mCondition); }
 
-  // Blocks until the calling thread holds the mutex (guards the awaited condition).
-  void lock() { mMutex.lock(); }
-  void unlock() { mMutex.unlock(); }
+  // Blocks until the calling thread holds the mutex (guards the awaited condition). The thread
+  // counts as a waiter from the start of lock() to the end of unlock().
+  void lock() {
+    mWaiters.fetch_add(1, std::memory_order_seq_cst);
+    try {
+      mMutex.lock();
+    } catch (...) {
+      mWaiters.fetch_sub(1, std::memory_order_seq_cst);
+      throw;
+    }
+  }
+  void unlock() {
+    mMutex.unlock();
+    mWaiters.fetch_sub(1, std::memory_order_seq_cst);
+  }
+
+  // True while any thread is between lock() and unlock(). Never blocks, never throws.
+  bool hasWaiters() const noexcept { return mWaiters.load(std::memory_order_seq_cst) != 0; }
 
   // The caller holds the mutex; it is released while the thread waits and held again on return.
   // Blocks until signalled (or woken spuriously).
@@ -42,4 +71,5 @@ class QNCConditional {
  private:
   QNCMutex mMutex;  // guards the condition the waiting threads test
   pthread_cond_t mCondition;
+  std::atomic<unsigned int> mWaiters{0};  // threads between lock() and unlock()
 };
