@@ -192,13 +192,21 @@ class HandOffSystem : public QNCSystem {
   void displayHelp() override {}
 };
 
-class OursParts {
+// Both of ours hand over with enlist + signal; they differ in the take.
+class OursPut {
  public:
   using Element = OurElement;
   void put(int aChannel, const Element& acrElement) {
     mSystem.enlist(aChannel, acrElement);
     mSystem.signal(aChannel);
   }
+
+ protected:
+  HandOffSystem mSystem;
+};
+
+class OursParts : public OursPut {
+ public:
   Element take(int aChannel) {
     for (;;) {
       mSystem.waitOnEmptyList(aChannel, aChannel);
@@ -208,26 +216,15 @@ class OursParts {
       }
     }
   }
-
- private:
-  HandOffSystem mSystem;
 };
 
-class OursExit {
+class OursExit : public OursPut {
  public:
-  using Element = OurElement;
-  void put(int aChannel, const Element& acrElement) {
-    mSystem.enlist(aChannel, acrElement);
-    mSystem.signal(aChannel);
-  }
   Element take(int aChannel) {
     Element lElement;
     if (mSystem.delistOrExit(aChannel, aChannel, 0, lElement) != QNWS_Ready) std::abort();
     return lElement;
   }
-
- private:
-  HandOffSystem mSystem;
 };
 
 template <class Element>
