@@ -3,6 +3,10 @@
 //   Logger/<threads>/ours          PrintLogMessageWithTimeStamp behind the QN_LOG_TRACE test
 //   Logger/<threads>/spdlog_sync   spdlog's basic_logger_mt (a mutex and a FILE per logger)
 //   Logger/<threads>/spdlog_async  spdlog's async logger (a queue and one worker) on a file sink
+//   Logger/<threads>/floor         what the logger's contract requires and nothing more: a line
+//                                  already formatted, copied whole into one shared batch under
+//                                  one lock (a spinning one, the cheapest), the batch written
+//                                  with write(2) when full and at the end of the round
 //   Logger/maskedoff/{ours,spdlog} a trace call whose level is masked off
 //
 // Every contender writes the same 126-byte line (time to the microsecond, tag, thread id, function,
@@ -13,13 +17,16 @@
 // after every line queued before it. Throughput is lines/s of all threads together.
 
 #include <benchmark/benchmark.h>
+#include <fcntl.h>
 #include <spdlog/async.h>
 #include <spdlog/sinks/basic_file_sink.h>
 #include <spdlog/spdlog.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <condition_variable>
 #include <cstdlib>
+#include <cstring>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -73,7 +80,7 @@ class QNCFlushCounter : public spdlog::sinks::base_sink<spdlog::details::null_mu
 };
 
 struct QNSBenchFiles {
-  std::string mOurs, mSync, mAsync;
+  std::string mOurs, mSync, mAsync, mFloor;
   std::shared_ptr<spdlog::logger> mpSync;
   std::shared_ptr<spdlog::async_logger> mpAsync;
   std::shared_ptr<QNCFlushCounter> mpAsyncFlushes;
@@ -92,6 +99,7 @@ QNSBenchFiles& files() {
     lpFiles->mOurs = lDir + "/ours.log";
     lpFiles->mSync = lDir + "/spdlog_sync.log";
     lpFiles->mAsync = lDir + "/spdlog_async.log";
+    lpFiles->mFloor = lDir + "/floor.log";
     CreateLogger(QNCString(lpFiles->mOurs.c_str()));
     const char* lpPattern = "%Y-%m-%d %H:%M:%S.%f -T- [%t] %! (%g:%#) %v";
     lpFiles->mpSync = spdlog::basic_logger_mt("sync", lpFiles->mSync);
@@ -156,12 +164,61 @@ void spdlogAsync(benchmark::State& arState) {
   arState.SetItemsProcessed(arState.iterations() * kRoundLines);
 }
 
+// The floor's shared batch: one lock, one buffer, one descriptor.
+class QNCFloorSink {
+ public:
+  explicit QNCFloorSink(const std::string& acrPath)
+      : mFd(open(acrPath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0640)) {
+    if (mFd < 0) abort();
+  }
+  void write(const char* apLine, size_t aLength) {
+    while (mTaken.exchange(true, std::memory_order_acquire))
+      while (mTaken.load(std::memory_order_relaxed)) __builtin_ia32_pause();
+    if (sizeof mBatch - mUsed < aLength) _writeOut();
+    memcpy(mBatch + mUsed, apLine, aLength);
+    mUsed += aLength;
+    mTaken.store(false, std::memory_order_release);
+  }
+  void flush() {
+    while (mTaken.exchange(true, std::memory_order_acquire)) __builtin_ia32_pause();
+    _writeOut();
+    mTaken.store(false, std::memory_order_release);
+  }
+
+ private:
+  void _writeOut() {
+    if (::write(mFd, mBatch, mUsed) != static_cast<ssize_t>(mUsed)) abort();
+    mUsed = 0;
+  }
+  alignas(64) std::atomic<bool> mTaken{false};
+  size_t mUsed = 0;
+  const int mFd;
+  char mBatch[64 * 1024];
+};
+
+void floorSink(benchmark::State& arState) {
+  startEmpty(arState, files().mFloor);
+  static QNCFloorSink* const spSink = new QNCFloorSink(files().mFloor);
+  // The same 126 bytes as the others' lines, formatted once.
+  char lText[160];
+  const int lLength =
+      snprintf(lText, sizeof lText, "2026-11-23 16:42:00.123456 -T- [%4d] %s (%s:%u) Entered\n",
+               1000 + arState.thread_index(), kFunction, kFile, kLine);
+  for (auto _ : arState) {
+    for (int lLine = 0; lLine < kRoundLines; ++lLine) spSink->write(lText, static_cast<size_t>(lLength));
+    spSink->flush();
+  }
+  arState.SetItemsProcessed(arState.iterations() * kRoundLines);
+}
+
 BENCHMARK(ours)->Name("Logger/1thread/ours")->Threads(1)->UseRealTime()->MinTime(0.1);
 BENCHMARK(spdlogSync)->Name("Logger/1thread/spdlog_sync")->Threads(1)->UseRealTime()->MinTime(0.1);
 BENCHMARK(spdlogAsync)->Name("Logger/1thread/spdlog_async")->Threads(1)->UseRealTime()->MinTime(0.1);
 BENCHMARK(ours)->Name("Logger/2threads/ours")->Threads(2)->UseRealTime()->MinTime(0.1);
 BENCHMARK(spdlogSync)->Name("Logger/2threads/spdlog_sync")->Threads(2)->UseRealTime()->MinTime(0.1);
 BENCHMARK(spdlogAsync)->Name("Logger/2threads/spdlog_async")->Threads(2)->UseRealTime()->MinTime(0.1);
+BENCHMARK(floorSink)->Name("Logger/1thread/floor")->Threads(1)->UseRealTime()->MinTime(0.1);
+BENCHMARK(floorSink)->Name("Logger/2threads/floor")->Threads(2)->UseRealTime()->MinTime(0.1);
 
 // The argument is the same for both and cheap; ours must not even evaluate it.
 const char* gspArgument = "an argument";
