@@ -116,24 +116,14 @@ class CommandLineParserTest : public ::testing::Test {
     const std::string lMessage = thrown<QNCInvalidEx>([&] { mParser.run(); });
     return lMessage == "(nothing thrown)" ? "" : lMessage;
   }
-  std::string valueOf(const char* apOption) {
-    QNCPointer<QNCCommandLineArgument> lArgument;
-    mParser.getArgument(apOption, lArgument);
-    auto* lpValue = dynamic_cast<QNCOptionValueArgument*>(lArgument.get());
-    return lpValue == nullptr ? "(flag)" : lpValue->getValue().get();
-  }
   QNCVector<QNSCommandLineArgumentDesc> mDesc;
   QNCCommandLineParser mParser;
 };
 
-// QnsensordTest pins the usage errors for an unknown option, a missing value and a flag given one.
+// QnsensordTest pins the usage errors for an unknown option, a missing value and a flag given one;
+// the command-line fuzz target holds every value found to the word after its option.
 TEST_F(CommandLineParserTest, ValuesFlagsAndRefusalsNamingTheOffendingWord) {
   ASSERT_EQ("", parse("  -d 16\t-v   -I -5 -c /etc/qn.conf -abcdefghijklmno"));
-  EXPECT_EQ("16", valueOf("-d"));
-  EXPECT_EQ("-5", valueOf("-I")) << "a negative number is a value, not an option";
-  EXPECT_EQ("/etc/qn.conf", valueOf("-c"));
-  EXPECT_EQ("(flag)", valueOf("-v"));
-  EXPECT_EQ("(flag)", valueOf("-abcdefghijklmno"));
   const std::pair<const char*, const char*> lRefusals[] = {
       {"-d16", "Unknown option '-d16'"},
       {"-abcdefghijklmnop", "Unknown option '-abcdefghijklmnop'"},

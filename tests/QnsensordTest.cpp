@@ -128,11 +128,12 @@ class Peer {
   }
   // The body of the next answer; "" when none arrives within aTimeoutMs.
   std::string answer(int aTimeoutMs = 4000) {
-    const auto lDeadline = Clock::now() + std::chrono::milliseconds(aTimeoutMs);
+    const timeval lTimeout = {aTimeoutMs / 1000, aTimeoutMs % 1000 * 1000};
+    setsockopt(mFd, SOL_SOCKET, SO_RCVTIMEO, &lTimeout, sizeof lTimeout);
     unsigned int lLength = 0;
-    if (!readExact(reinterpret_cast<char*>(&lLength), 4, lDeadline) || lLength > 4096) return "";
+    if (recv(mFd, &lLength, 4, MSG_WAITALL) != 4 || lLength > 4096) return "";
     std::string lBody(lLength, '\0');
-    return readExact(&lBody[0], lLength, lDeadline) ? lBody : "";
+    return recv(mFd, &lBody[0], lLength, MSG_WAITALL) == static_cast<ssize_t>(lLength) ? lBody : "";
   }
   bool readable(int aTimeoutMs) {
     pollfd lPoll = {mFd, POLLIN, 0};
@@ -140,17 +141,6 @@ class Peer {
   }
 
  private:
-  bool readExact(char* apTarget, unsigned int aCount, Clock::time_point aDeadline) {
-    for (unsigned int lDone = 0; lDone < aCount;) {
-      const auto lLeft =
-          std::chrono::duration_cast<std::chrono::milliseconds>(aDeadline - Clock::now()).count();
-      if (lLeft <= 0 || !readable(static_cast<int>(lLeft))) return false;
-      const long lRead = recv(mFd, apTarget + lDone, aCount - lDone, 0);
-      if (lRead <= 0) return false;
-      lDone += static_cast<unsigned int>(lRead);
-    }
-    return true;
-  }
   int mFd;
 };
 
