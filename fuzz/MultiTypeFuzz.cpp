@@ -9,10 +9,8 @@
 //   read is that number, and its encoding decodes back to the same value;
 // - a text is taken unchanged.
 
-#include <cerrno>
 #include <climits>
 #include <cstdint>
-#include <cstdlib>
 #include <cstring>
 #include <string>
 

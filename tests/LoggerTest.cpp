@@ -144,9 +144,8 @@ TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
       lLog, {") early trace 1\n", ") early error 3\n", ") early warning 4\n", ") after open 5\n"});
   // Urgent lines went to standard error at once, before and after the log; nothing else did.
   const std::string lStderr = stdErr();
-  EXPECT_EQ(1u, countOf(lStderr, "early error 3"));
-  EXPECT_EQ(1u, countOf(lStderr, "early warning 4"));
-  EXPECT_EQ(1u, countOf(lStderr, "after destroy 7"));
+  for (const char* lpUrgent : {"early error 3", "early warning 4", "after destroy 7"})
+    EXPECT_EQ(1u, countOf(lStderr, lpUrgent)) << lpUrgent;
   EXPECT_EQ(3u, linesOf(lStderr).size()) << lStderr;
   EXPECT_EQ(0u, countOf(lStderr, "-T-"));
 }

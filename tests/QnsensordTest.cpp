@@ -4,7 +4,6 @@
 // start's result, the daemon it leaves, the systemd notifications) and a hostile peer (resets,
 // silence, stalls, readers that never read, invented names, a channel that cannot accept).
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <pwd.h>
@@ -36,8 +35,6 @@ using qntest::readFile;
 using std::chrono::milliseconds;
 using Clock = std::chrono::steady_clock;
 
-long lineCount(const std::string& acrText) { return std::count(acrText.begin(), acrText.end(), '\n'); }
-
 // The process id in a 4-byte PID file; 0 when there is none.
 int pidIn(const std::string& acrPidFile) {
   const std::string lBytes = readFile(acrPidFile);
@@ -45,42 +42,6 @@ int pidIn(const std::string& acrPidFile) {
   if (lBytes.size() == sizeof lPid) memcpy(&lPid, lBytes.data(), sizeof lPid);
   return lPid;
 }
-
-// A bound AF_UNIX datagram socket: a path, or "@name" in the abstract namespace.
-class NotifySocket {
- public:
-  explicit NotifySocket(const std::string& acrAddress) : mFd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
-    struct sockaddr_un lAddress = {};
-    lAddress.sun_family = AF_UNIX;
-    memcpy(lAddress.sun_path, acrAddress.data(), acrAddress.size());
-    if (acrAddress[0] == '@') lAddress.sun_path[0] = '\0';
-    const socklen_t lLength =
-        static_cast<socklen_t>(offsetof(struct sockaddr_un, sun_path) + acrAddress.size());
-    EXPECT_EQ(0, bind(mFd, reinterpret_cast<struct sockaddr*>(&lAddress), lLength)) << strerror(errno);
-  }
-  ~NotifySocket() { close(mFd); }
-
-  // The datagrams that arrive until one equals acrLast (kept) or aTimeout has passed; with no
-  // time-out, those already waiting.
-  std::vector<std::string> until(const std::string& acrLast, milliseconds aTimeout) {
-    std::vector<std::string> lReceived;
-    const auto lDeadline = Clock::now() + aTimeout;
-    for (;;) {
-      const auto lLeft = std::chrono::duration_cast<milliseconds>(lDeadline - Clock::now()).count();
-      struct pollfd lPoll = {mFd, POLLIN, 0};
-      if (poll(&lPoll, 1, lLeft > 0 ? static_cast<int>(lLeft) : 0) <= 0) break;
-      char lData[4096];
-      const ssize_t lSize = recv(mFd, lData, sizeof lData, 0);
-      if (lSize <= 0) continue;
-      lReceived.emplace_back(lData, static_cast<size_t>(lSize));
-      if (lReceived.back() == acrLast) break;
-    }
-    return lReceived;
-  }
-
- private:
-  int mFd;
-};
 
 // The daemon process as /proc shows it: its parent, session, working directory, umask and the
 // targets of descriptors 0-2 and aHighFd ("" when closed).
@@ -103,17 +64,20 @@ std::map<std::string, std::string> daemonState(int aPid, int aHighFd) {
 }
 
 // One client connection, written with raw socket calls so it can misbehave; with aBind, a socket
-// bound at the path that nobody accepts on. A blocking read times out after 10 s, so a stalled
+// bound at the address that nobody accepts on (with SOCK_DGRAM: one that receives datagrams;
+// "@name" is in the abstract namespace). A blocking read times out after 10 s, so a stalled
 // service fails the test instead of hanging it.
 class Peer {
  public:
-  explicit Peer(const std::string& acrPath, bool aBind = false)
-      : mFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+  explicit Peer(const std::string& acrAddress, bool aBind = false, int aType = SOCK_STREAM)
+      : mFd(socket(AF_UNIX, aType | SOCK_CLOEXEC, 0)) {
     sockaddr_un lAddress = {};
     lAddress.sun_family = AF_UNIX;
-    snprintf(lAddress.sun_path, sizeof lAddress.sun_path, "%s", acrPath.c_str());
+    memcpy(lAddress.sun_path, acrAddress.data(), acrAddress.size());
+    if (acrAddress[0] == '@') lAddress.sun_path[0] = '\0';
+    const auto lLength = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + acrAddress.size());
     auto lpCall = aBind ? &bind : &connect;
-    EXPECT_EQ(0, lpCall(mFd, reinterpret_cast<sockaddr*>(&lAddress), sizeof lAddress)) << strerror(errno);
+    EXPECT_EQ(0, lpCall(mFd, reinterpret_cast<sockaddr*>(&lAddress), lLength)) << strerror(errno);
     const timeval lTimeout = {10, 0};
     setsockopt(mFd, SOL_SOCKET, SO_RCVTIMEO, &lTimeout, sizeof lTimeout);
   }
@@ -128,29 +92,36 @@ class Peer {
   }
   // The body of the next answer; "" when none arrives within aTimeoutMs.
   std::string answer(int aTimeoutMs = 4000) {
-    const auto lDeadline = Clock::now() + std::chrono::milliseconds(aTimeoutMs);
+    const timeval lTimeout = {aTimeoutMs / 1000, aTimeoutMs % 1000 * 1000};
+    setsockopt(mFd, SOL_SOCKET, SO_RCVTIMEO, &lTimeout, sizeof lTimeout);
     unsigned int lLength = 0;
-    if (!readExact(reinterpret_cast<char*>(&lLength), 4, lDeadline) || lLength > 4096) return "";
+    if (recv(mFd, &lLength, 4, MSG_WAITALL) != 4 || lLength > 4096) return "";
     std::string lBody(lLength, '\0');
-    return readExact(&lBody[0], lLength, lDeadline) ? lBody : "";
+    return recv(mFd, &lBody[0], lLength, MSG_WAITALL) == static_cast<ssize_t>(lLength) ? lBody : "";
   }
   bool readable(int aTimeoutMs) {
     pollfd lPoll = {mFd, POLLIN, 0};
     return poll(&lPoll, 1, aTimeoutMs) == 1;
   }
 
- private:
-  bool readExact(char* apTarget, unsigned int aCount, Clock::time_point aDeadline) {
-    for (unsigned int lDone = 0; lDone < aCount;) {
-      const auto lLeft =
-          std::chrono::duration_cast<std::chrono::milliseconds>(aDeadline - Clock::now()).count();
-      if (lLeft <= 0 || !readable(static_cast<int>(lLeft))) return false;
-      const long lRead = recv(mFd, apTarget + lDone, aCount - lDone, 0);
-      if (lRead <= 0) return false;
-      lDone += static_cast<unsigned int>(lRead);
+  // The datagrams that arrive until one equals acrLast (kept) or aTimeout has passed; with no
+  // time-out, those already waiting.
+  std::vector<std::string> until(const std::string& acrLast, milliseconds aTimeout) {
+    std::vector<std::string> lReceived;
+    const auto lDeadline = Clock::now() + aTimeout;
+    for (;;) {
+      const auto lLeft = std::chrono::duration_cast<milliseconds>(lDeadline - Clock::now()).count();
+      if (!readable(lLeft > 0 ? static_cast<int>(lLeft) : 0)) break;
+      char lData[4096];
+      const ssize_t lSize = recv(mFd, lData, sizeof lData, 0);
+      if (lSize <= 0) continue;
+      lReceived.emplace_back(lData, static_cast<size_t>(lSize));
+      if (lReceived.back() == acrLast) break;
     }
-    return true;
+    return lReceived;
   }
+
+ private:
   int mFd;
 };
 
@@ -217,15 +188,7 @@ class QnsensordTest : public ::testing::Test {
     return lRun;
   }
 
-  std::string writeConfig(const std::string& acrContents) {
-    qntest::writeFile(mDir.file("qnsensord.conf"), acrContents);
-    return mDir.file("qnsensord.conf");
-  }
   bool hasPidFile() const { return access(mDir.file("qnsensord.pid").c_str(), F_OK) == 0; }
-  // Lines written after applySettings come from the process that was started: it stayed in front.
-  static bool ranInFront(const Run& acrRun) {
-    return acrRun.mLog.find("[" + std::to_string(acrRun.mPid) + "] init") != std::string::npos;
-  }
 
   qntest::TempDir mDir;
   std::string mLog = mDir.file("qnsensord.log");
@@ -286,7 +249,8 @@ TEST_F(QnsensordTest, ConfigFileSuppliesTheSettingsOrStopsStartUp) {
       {"DebugLevel = 255\nHbTimeout = 30\nDaemonize = 0\nDebugLevl = 8\n", ":4: unknown key 'DebugLevl'"},
   };
   for (const auto& lrCase : lCases) {
-    const std::string lPath = writeConfig(lrCase.first);
+    const std::string lPath = mDir.file("qnsensord.conf");
+    qntest::writeFile(lPath, lrCase.first);
     const Run lRun = run({"-c", lPath});
     EXPECT_NE(0, lRun.mStatus) << lrCase.second;
     EXPECT_NE(std::string::npos, lRun.mStderr.find(lPath + lrCase.second)) << lRun.mStderr;
@@ -295,7 +259,8 @@ TEST_F(QnsensordTest, ConfigFileSuppliesTheSettingsOrStopsStartUp) {
   const Run lRun =
       run({"-c", std::string(QN_SOURCE_DIR) + "/examples/qnsensord.conf", "-d", "255", "-D", "true"});
   EXPECT_EQ(0, lRun.mStatus) << lRun.mStderr;
-  EXPECT_TRUE(ranInFront(lRun)) << lRun.mLog;
+  // Lines written after applySettings come from the process that was started: it stayed in front.
+  EXPECT_NE(std::string::npos, lRun.mLog.find("[" + std::to_string(lRun.mPid) + "] init")) << lRun.mLog;
   EXPECT_NE(std::string::npos, lRun.mLog.find("Using 2 sensor channels"));
   EXPECT_EQ(std::string::npos, lRun.mLog.find(" -T- "))
       << "DebugLevel = 57 holds no trace; -d 255 is not read";
@@ -346,7 +311,7 @@ TEST_F(QnsensordTest, ServesReadingsAndStopsOnRequest) {
 TEST_F(SensorSecurityTest, FloodOfMalformedReadingsAddsFewLogLines) {
   constexpr unsigned int kFlood = 200000;
   start({"-n", "1", "-b", "3600"});
-  const long lLinesBefore = lineCount(readFile(mLog));
+  const size_t lLinesBefore = qntest::countOf(readFile(mLog), "\n");
   std::string lFrames;
   for (unsigned int lSequence = 0; lSequence < kFlood; ++lSequence) {
     const std::string lBody = "s " + std::to_string(lSequence) + " x";
@@ -368,7 +333,8 @@ TEST_F(SensorSecurityTest, FloodOfMalformedReadingsAddsFewLogLines) {
   shutdown(lFd, SHUT_RDWR);
   lSender.join();
   ASSERT_NE(std::string::npos, lTail.find("ERR 199999 bad value"));
-  EXPECT_LE(lineCount(readFile(mLog)) - lLinesBefore, 11 * (lSeconds + 1) + 2)
+  EXPECT_LE(qntest::countOf(readFile(mLog), "\n") - lLinesBefore,
+            static_cast<size_t>(11 * (lSeconds + 1) + 2))
       << "flood of " << lSeconds << " s";
 
   stop();
@@ -542,7 +508,7 @@ TEST_F(SensorRobustnessTest, StalledPeerDoesNotDelayShutDown) {
 // stop once it is gone.
 TEST(DaemonStartTest, StartingCommandTellsHowTheDaemonStarted) {
   qntest::TempDir lDir;
-  NotifySocket lNotify(lDir.file("notify"));
+  Peer lNotify(lDir.file("notify"), true, SOCK_DGRAM);
   const std::string lMissing = lDir.file("missing");
   struct QNSCase {
     const char* mName;
@@ -622,7 +588,7 @@ TEST(DaemonStartTest, StartingCommandTellsHowTheDaemonStarted) {
 TEST(ServiceNotifyTest, ReadyWatchdogAndStoppingReachTheNotifySocket) {
   qntest::TempDir lDir;
   for (const std::string& acrAddress : {lDir.file("notify"), "@qn-notify-test-" + std::to_string(getpid())}) {
-    NotifySocket lNotify(acrAddress);
+    Peer lNotify(acrAddress, true, SOCK_DGRAM);
     const pid_t lService =
         qntest::spawn({qntest::builtProgram("examples/qnsensord"), "-D", "false", "-d", "127"},
                       {"QN_LOG_DIR=" + lDir.path(), "NOTIFY_SOCKET=" + acrAddress, "WATCHDOG_USEC=300000"},

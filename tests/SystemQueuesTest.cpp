@@ -1,6 +1,7 @@
 // The system object's numbered services: synchronised queues and lists (one set of cases run on
 // both, the exit-aware waits among them), waits on the numbered conditionals, a stress run of
-// many producers and consumers, and the one table of assertions (numbers, pointers, buffers).
+// many producers and consumers, the one table of assertions (numbers, pointers, buffers), and the
+// error line that names a member the application's system class left unset.
 
 #include <gtest/gtest.h>
 
@@ -14,6 +15,7 @@
 #include "BufferManager.h"
 #include "DeathTestSupport.h"
 #include "Logger.h"
+#include "Mutex.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
 
@@ -367,6 +369,41 @@ TEST(MisuseDeathTest, EveryBrokenConditionIsAnAssertion) {
   };
   for (const auto& lrCase : lCases)
     EXPECT_EXIT(lrCase.mCall(), ::testing::ExitedWithCode(1), qntest::assertionFailure(lrCase.mCondition));
+}
+
+// A system class that lacks a member an operation needs still ends by the pointer's assertion
+// (status 1), but an error line names the member and where to set it first: without it, the
+// newcomer sees only "Assertion [ 0 != mPointer ] failed" at Pointer.h. (A missing instance
+// manager or version at start-up: the Consumer.newcomer test.) BareSystem sets none of the
+// members the application must provide.
+class BareSystem : public QNCSystem {
+ public:
+  void setCommandLineArgumentDesc() override {}
+  void parseConfigFile(QNCString&) override {}
+  void displayHelp() override {}
+  void dropExitLock() { mExitLock = QNCPointer<QNCMutex>(); }
+};
+
+void expectNamedBeforeAssertion(void (*apCall)(BareSystem&), const char* apMember) {
+  BareSystem lSystem;
+  EXPECT_EXIT(apCall(lSystem), ::testing::ExitedWithCode(1),
+              std::string("-E- .*QNCSystem::") + apMember +
+                  " is not set: [^\n]*\n.*-H- .*Assertion \\[ 0 != mPointer \\] failed");
+}
+
+TEST(SystemNewcomerTest, MissingMemberIsNamedAtErrorLevelBeforeTheAssertion) {
+  static QNCPointer<QNCBuffer> lsBuffer;
+  expectNamedBeforeAssertion([](BareSystem& arSystem) { arSystem.getBuffer(64, lsBuffer); },
+                             "mBufferManager");
+  expectNamedBeforeAssertion([](BareSystem& arSystem) { arSystem.reuseBuffer(lsBuffer); }, "mBufferManager");
+  expectNamedBeforeAssertion([](BareSystem& arSystem) { arSystem.killRunningInstance(); },
+                             "mProcessInstanceManager");
+  expectNamedBeforeAssertion(
+      [](BareSystem& arSystem) {
+        arSystem.dropExitLock();
+        arSystem.setForExit();
+      },
+      "mExitLock");
 }
 
 }  // namespace

@@ -1,22 +1,41 @@
-// The system object within one process: the driver's free functions (the log path),
-// starting and stopping the threads, the settings and the common command-line options.
+// The system object within one process: the driver's free functions (the log path), the
+// threads (a thread component, a thread pool, the system starting and stopping them, and what
+// happens when one of them dies), the settings and the common command-line options; then the
+// readers of outside text under them: the configuration file parser, the command-line parser
+// and the decoding of setting values. The fuzz targets (fuzz/) hold those to their properties
+// over stored inputs in every build; these cases pin the exact results and messages.
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
+#include <condition_variable>
 #include <cstdlib>
+#include <cstring>
+#include <functional>
+#include <future>
+#include <mutex>
+#include <stdexcept>
+#include <string>
 #include <thread>
+#include <vector>
 
+#include "CommandLineParser.h"
+#include "KeyValueFormatParser.h"
 #include "LogSupport.h"
 #include "MultiType.h"
 #include "Mutex.h"
 #include "NumericIdManager.h"
+#include "RunStatus.h"
 #include "SystemGlobals.h"
 #include "TableSystem.h"
+#include "ThreadComponent.h"
+#include "ThreadPool.h"
 
 namespace {
 
 using qntest::expectInOrder;
+using qntest::thrown;
 
 // The log path setLogFilePath composes with QN_LOG_DIR set to apDir (unset when null), and the
 // log directory then reported. The directory is read from the environment each time.
@@ -42,7 +61,224 @@ TEST(DriverTest, LogPathIsTheVariableOrTmpAndTheNameCutTo511Characters) {
   unsetenv("QN_LOG_DIR");
 }
 
-// --- Threads. A component refuses exit requests with the exception it is given.
+// --- A thread component and a thread pool on their own.
+constexpr unsigned int kHour = 3600u * 1000u;
+
+using qntest::ScriptedComponent;
+
+// Fault pinned for the request made first: a wait that only listens for notifications would
+// sleep the whole period instead of seeing the request already given.
+TEST(ThreadComponentTest, RequestExitWakesABodyInALongWaitEvenWhenMadeBeforeIt) {
+  for (const bool lRequestFirst : {false, true}) {
+    std::promise<void> lStarted, lGate;
+    std::shared_future<void> lGateOpen = lGate.get_future().share();
+    std::atomic<bool> lWoken{false};
+    ScriptedComponent lComponent([&](ScriptedComponent& arSelf) {
+      lStarted.set_value();
+      if (lRequestFirst) lGateOpen.wait();
+      lWoken = arSelf.waitForExitRequest(kHour);
+    });
+    lComponent.init();
+    lStarted.get_future().wait();
+    lComponent.requestExit();
+    lGate.set_value();
+    lComponent.waitForExit();  // would block for an hour if the request did not end the wait
+    EXPECT_TRUE(lWoken) << lRequestFirst;
+  }
+}
+
+// A request before init() is refused; init() runs once; joins and requests after the end are
+// no-ops. Fault pinned: the owner joins (holding the join lock) while the body waits for its own
+// exit; the body blocked on that lock and the join never finished.
+TEST(ThreadComponentTest, LifecycleStatesAndRepeatedCalls) {
+  std::atomic<int> lSeen{0};
+  ScriptedComponent lComponent([&](ScriptedComponent& arSelf) {
+    lSeen += arSelf.isExitRequested() ? 100 : 1;
+    lSeen += arSelf.waitForExitRequest(1) ? 100 : 1;
+    lSeen += qntest::thrown<QNCInvalidEx>([&] { arSelf.waitForExit(); }) == "(nothing thrown)" ? 100 : 1;
+  });
+  EXPECT_EQ("Thread 'scripted' was never started",
+            qntest::thrown<QNCInvalidEx>([&] { lComponent.requestExit(); }));
+  lComponent.waitForExit();  // never started: returns at once
+  lComponent.init();
+  EXPECT_THROW(lComponent.init(), QNCInvalidEx);
+  lComponent.waitForExit();
+  EXPECT_EQ(3, lSeen.load());
+  EXPECT_FALSE(lComponent.isExitRequested());
+  lComponent.waitForExit();            // already joined: returns at once
+  EXPECT_TRUE(lComponent.isInited());  // started once, stays so after the end
+  lComponent.requestExit();            // the thread has ended: no effect, no failure
+}
+
+// Destroying a started, never-joined component must not reach std::terminate (a joinable
+// std::thread destroyed) nor leave the thread behind: the base destructor wakes and joins it.
+std::atomic<bool> gsSleeperReturned{false};
+
+TEST(ThreadComponentTest, DestructorEndsAndJoinsARunningThread) {
+  std::promise<void> lAsleep;
+  auto* lpComponent = new ScriptedComponent(
+      [&](ScriptedComponent& arSelf) {
+        lAsleep.set_value();
+        while (!arSelf.waitForExitRequest(kHour)) {
+        }
+        gsSleeperReturned = true;
+      },
+      "scripted", false);
+  lpComponent->init();
+  lAsleep.get_future().wait();
+  delete lpComponent;
+  EXPECT_TRUE(gsSleeperReturned);
+}
+
+// Tasks submitted before init() wait for the workers; every task runs exactly once; two tasks
+// that wait for each other both finish, so the workers run at the same time.
+TEST(ThreadPoolTest, EveryTaskRunsExactlyOnceOnWorkersRunningTogether) {
+  std::vector<std::atomic<int>> lRuns(2000);
+  std::mutex lLock;
+  std::condition_variable lArrived;
+  int lCount = 0;
+  std::atomic<int> lMet{0};
+  QNCThreadPool lPool("counters", 3);
+  for (unsigned int lIndex = 0; lIndex < lRuns.size(); ++lIndex) {
+    if (lIndex == 2) lPool.init();
+    lPool.submit([&lRuns, lIndex] { ++lRuns[lIndex]; });
+  }
+  for (int lIndex = 0; lIndex < 2; ++lIndex) {
+    lPool.submit([&] {
+      std::unique_lock<std::mutex> lGuard(lLock);
+      ++lCount;
+      lArrived.notify_all();
+      if (lArrived.wait_for(lGuard, std::chrono::seconds(30), [&] { return lCount == 2; })) ++lMet;
+    });
+  }
+  lPool.finish();
+  lPool.waitForThreads();
+  for (unsigned int lIndex = 0; lIndex < lRuns.size(); ++lIndex) ASSERT_EQ(1, lRuns[lIndex].load()) << lIndex;
+  EXPECT_EQ(2, lMet);
+}
+
+// finish() while every worker is busy, called directly or by the destructor of a pool that was
+// never finished: what was queued before still runs, a later submission is refused, and the
+// workers end (destroying joinable threads would terminate the process).
+TEST(ThreadPoolTest, FinishWhileTasksRunDrainsTheQueueAndRefusesLaterTasks) {
+  for (const bool lByDestructor : {false, true}) {
+    std::promise<void> lGate;
+    std::shared_future<void> lGateOpen = lGate.get_future().share();
+    std::atomic<int> lBusy{0}, lDone{0};
+    {
+      QNCThreadPool lPool("drain", 2);
+      lPool.init();
+      for (int lIndex = 0; lIndex < 2; ++lIndex) {
+        lPool.submit([&] {
+          ++lBusy;
+          lGateOpen.wait();
+          ++lDone;
+        });
+      }
+      for (int lIndex = 0; lIndex < 5; ++lIndex) lPool.submit([&] { ++lDone; });
+      while (lBusy.load() < 2) std::this_thread::yield();  // both workers are inside a task
+      if (!lByDestructor) {
+        lPool.finish();
+        EXPECT_EQ("ThreadPool 'drain' is finished: task refused",
+                  qntest::thrown<QNCExitConditionEx>([&] { lPool.submit([] {}); }));
+      }
+      lGate.set_value();
+    }
+    EXPECT_EQ(7, lDone) << lByDestructor;
+  }
+}
+
+// Fault pinned: the owner joins (holding the join lock) while a task asks to wait for the pool
+// too; the task blocked on that lock and the join never finished.
+TEST(ThreadPoolTest, MisuseIsRefusedWithClearErrors) {
+  EXPECT_EQ("ThreadPool 'none' needs at least one thread",
+            qntest::thrown<QNCInvalidEx>([] { QNCThreadPool lEmpty("none", 0); }));
+  std::atomic<int> lRefused{0};
+  QNCThreadPool lPool("self", 1);
+  EXPECT_THROW(lPool.submit(QNCThreadPool::QNTTask()), QNCInvalidEx);
+  lPool.waitForThreads();  // never started: returns at once
+  lPool.init();
+  EXPECT_THROW(lPool.init(), QNCInvalidEx);
+  lPool.submit([&] {
+    lRefused += qntest::thrown<QNCInvalidEx>([&] { lPool.waitForThreads(); }) != "(nothing thrown)";
+  });
+  lPool.finish();
+  lPool.finish();  // idempotent
+  lPool.waitForThreads();
+  lPool.waitForThreads();  // already joined
+  EXPECT_EQ(1, lRefused);
+}
+
+// --- Threads that die. The cases run in file order: the restart case first, while the run has
+// not failed yet.
+qntest::TableSystem* gspSystem = nullptr;
+std::atomic<int> gsExitRequests{0};
+void requestExit() {
+  ++gsExitRequests;
+  gspSystem->makeThreadsToExit();
+}
+
+class ThreadFailureTest : public qntest::LoggedTest {
+ protected:
+  void SetUp() override {
+    LoggedTest::SetUp();
+    gspSystem = &mSystem;
+    QNSetExitRequest(requestExit);
+  }
+  void TearDown() override {
+    QNSetExitRequest(nullptr);
+    LoggedTest::TearDown();
+  }
+  qntest::TableSystem mSystem;
+};
+
+// Two failures, each restarted by the override: the third run serves until the exit request; the
+// run has not failed and nobody asked for an exit.
+TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
+  qntest::ScriptedComponent* lpComponent = &mSystem.addComponent(new qntest::ScriptedComponent(
+      [](qntest::ScriptedComponent& arSelf) {
+        if (arSelf.mRuns.load() <= 2) throw std::runtime_error("sensor bus gone");
+        while (!arSelf.waitForExitRequest(1000)) {
+        }
+      },
+      "Restarter"));
+  lpComponent->mRestart = true;
+  mSystem.startThreads();
+  while (lpComponent->mRuns.load() < 3) std::this_thread::yield();
+  mSystem.makeThreadsToExit();
+  mSystem.waitForThreads();
+  EXPECT_EQ(3, lpComponent->mRuns.load());
+  EXPECT_FALSE(hasRunFailed());
+  EXPECT_EQ(0, getRunExitStatus());
+  EXPECT_EQ(0, gsExitRequests.load());  // the first failure case of the file
+  EXPECT_EQ(2u, qntest::countOf(log(), "Thread 'Restarter' restarts its work"));
+}
+
+// A component that dies, beside one that only ends on request and a pool: the dead one's error
+// line names it and the exception, the run is failed (status 1), and the exit request it started
+// ends the others, so waitForThreads returns. Before: the others ran on and the status stayed 0.
+TEST_F(ThreadFailureTest, FailingPoolTaskFailsTheRun) {
+  const int lBefore = gsExitRequests.load();
+  const std::vector<std::pair<std::function<void()>, std::string>> lCases = {
+      {[] { throw QNCInvalidEx("sensor lost", 6); }, "sensor lost"},
+      {[] { throw std::runtime_error("report lost"); }, "report lost"},
+      {[] { throw 42; }, "unknown exception"}};
+  QNCThreadPool lPool("Failing", 1);
+  std::atomic<int> lLaterTasks{0};
+  lPool.init();
+  for (const auto& lrCase : lCases) lPool.submit(lrCase.first);
+  lPool.submit([&lLaterTasks] { ++lLaterTasks; });
+  lPool.finish();
+  lPool.waitForThreads();
+  EXPECT_EQ(1, lLaterTasks.load());
+  EXPECT_EQ(lBefore + 3, gsExitRequests.load());
+  const std::string lLog = log();
+  for (const auto& lrCase : lCases)
+    EXPECT_EQ("-E-", qntest::levelOf(lLog, "ThreadPool 'Failing': task failed: " + lrCase.second)) << lLog;
+}
+
+// --- The system starting and stopping its threads. A component refuses exit requests with the
+// exception it is given.
 template <class E>
 qntest::ScriptedComponent* refusing(const char* apName, std::atomic<int>& arRequests) {
   auto* lpComponent = new qntest::ScriptedComponent([](qntest::ScriptedComponent&) {}, apName);
@@ -322,6 +558,153 @@ TEST_F(CommandLineTest, GivenValuesReplaceOnlyTheirOwnDefaultsReadLikeAtoi) {
       log(), {"Command line : '-d 16 -I 30'", "Processed the command line successfully : -d 16 -I 30",
               "No arguments in command line", "The -I option is not specified, using default interval 15 min",
               "Zero/Invalid value specified for -I option. DB won't be reopened at fixed intervals"});
+}
+
+// --- The readers of outside text.
+class KeyValueFormatParserTest : public ::testing::Test {
+ protected:
+  std::string write(const std::string& acrText) {
+    const std::string lPath = mDir.file("f" + std::to_string(mFiles++) + ".conf");
+    qntest::writeFile(lPath, acrText);
+    return lPath;
+  }
+  qntest::TempDir mDir;
+  int mFiles = 0;
+};
+
+TEST_F(KeyValueFormatParserTest, ReadsKeysValuesAndLinesSkippingCommentsAndBlanks) {
+  const std::string lPath = write(
+      "# the sensor service\n\n   ; another comment\n  Port   =   4711  \n"
+      "\tName\t=\tfront door\t\r\nQuery = a=b=c\nEmpty =\nlast=1");
+  QNCKeyValueFormatParser lParser(QNCString(lPath.c_str()), QNCString(""), false, false);
+  lParser.parse();
+  QNCVector<QNCString> lKeys;
+  lParser.getKeys(lKeys);
+  std::string lJoined;
+  for (unsigned int lIndex = 0; lIndex < lKeys.numberOfElements(); ++lIndex)
+    lJoined += std::string(lKeys[lIndex].get()) + "=" + lParser.getValue(lKeys[lIndex]).get() + ":" +
+               std::to_string(lParser.getLine(lKeys[lIndex])) + ";";
+  EXPECT_EQ("Port=4711:4;Name=front door:5;Query=a=b=c:6;Empty=:7;last=1:8;", lJoined);
+  EXPECT_FALSE(lParser.hasKey("name"));  // exact comparison by default
+  EXPECT_NE(std::string::npos, thrown<QNCNotFoundEx>([&] { lParser.getValue("colour"); }).find("'colour'"));
+  // Other comment markers, keys without regard to case, a later duplicate replacing the value.
+  QNCKeyValueFormatParser lOther(
+      QNCString(write("// note\n# not a comment = yes\nHOST = x\nhost = y\n").c_str()), QNCString("/"), true,
+      true);
+  lOther.parse();
+  EXPECT_STREQ("yes", lOther.getValue("# not a comment").get());
+  EXPECT_STREQ("y", lOther.getValue("Host").get());
+  EXPECT_EQ(4u, lOther.getLine("host"));
+}
+
+TEST_F(KeyValueFormatParserTest, BadFilesAreRefusedNamingFileAndLine) {
+  const struct {
+    std::string mText;
+    bool mFold;
+    std::string mMessage;
+  } lCases[] = {
+      {"a = 1\n\njust words\n", false, ":3: expected 'key = value'"},
+      {"  = 5\n", false, ":1: expected 'key = value'"},
+      {std::string("a = 1\nb = x\0y\n", 14), false, ":2: expected 'key = value'"},
+      {"a = 1\nb = 2\nA = 3\na = 4\n", false, ":4: key 'a' already set on line 1"},
+      {"a = 1\nb = 2\nA = 3\na = 4\n", true, ":3: key 'A' already set on line 1"},
+  };
+  for (const auto& lrCase : lCases) {
+    const std::string lPath = write(lrCase.mText);
+    QNCKeyValueFormatParser lParser(QNCString(""), QNCString(""), lrCase.mFold, false);
+    EXPECT_EQ(lPath + lrCase.mMessage,
+              thrown<QNCException>([&] { lParser.parse(QNCString(lPath.c_str())); }));
+  }
+  // getUnsigned is held to an independent decimal reading by the KeyValueFormatParser fuzz target.
+}
+
+// A file that cannot be opened, read or parsed leaves what was read before; a good one replaces it.
+TEST_F(KeyValueFormatParserTest, OnlyASuccessfulParseReplacesThePreviousContents) {
+  const std::string lGood = write("a = 1\n");
+  QNCKeyValueFormatParser lParser(QNCString(lGood.c_str()), QNCString(""), false, false);
+  lParser.parse();
+  const std::string lMissing = mDir.file("missing.conf");
+  EXPECT_NE(std::string::npos, thrown<QNCOpenFailedEx>([&] {
+                                 lParser.parse(QNCString(lMissing.c_str()));
+                               }).find("'" + lMissing + "'"));
+  EXPECT_NE(std::string::npos, thrown<QNCReadFailedEx>([&] {
+                                 lParser.parse(QNCString(mDir.path().c_str()));  // opens, cannot be read
+                               }).find("'" + mDir.path() + "'"));
+  EXPECT_THROW(lParser.parse(QNCString(write("b = 2\nbroken\n").c_str())), QNCInvalidEx);
+  EXPECT_STREQ("1", lParser.getValue("a").get());
+  EXPECT_FALSE(lParser.hasKey("b"));
+  EXPECT_EQ(lGood, lParser.getFilePath().get());
+  const std::string lSecond = write("b = 2\n");
+  lParser.parse(QNCString(lSecond.c_str()));
+  EXPECT_FALSE(lParser.hasKey("a"));
+  EXPECT_EQ(lSecond, lParser.getFilePath().get());
+}
+
+// The eight common options plus one of the application's own ("-n", with a value), and one whose
+// descriptor fills its whole array (no NUL: matching must stay inside the array).
+class CommandLineParserTest : public ::testing::Test {
+ protected:
+  CommandLineParserTest() {
+    for (const char* lpOption : {"-v", "-h", "-s", "-abcdefghijklmno"}) add(lpOption, 0);
+    for (const char* lpOption : {"-c", "-d", "-b", "-D", "-I", "-n"}) add(lpOption, 1);
+  }
+  void add(const char* apOption, unsigned int aTakesValue) {
+    QNSCommandLineArgumentDesc lDesc = {};
+    memcpy(lDesc.mOption, apOption, std::min(strlen(apOption), sizeof lDesc.mOption));
+    lDesc.mTakesValue = aTakesValue;
+    mDesc.append(lDesc);
+  }
+  // "" when run() accepts the line, else the message of its QNCInvalidEx.
+  std::string parse(const char* apLine) {
+    mParser.setCommandLine(apLine);
+    mParser.setArgumentDesc(mDesc);
+    const std::string lMessage = thrown<QNCInvalidEx>([&] { mParser.run(); });
+    return lMessage == "(nothing thrown)" ? "" : lMessage;
+  }
+  QNCVector<QNSCommandLineArgumentDesc> mDesc;
+  QNCCommandLineParser mParser;
+};
+
+// QnsensordTest pins the usage errors for an unknown option, a missing value and a flag given one;
+// the command-line fuzz target holds every value found to the word after its option.
+TEST_F(CommandLineParserTest, ValuesFlagsAndRefusalsNamingTheOffendingWord) {
+  ASSERT_EQ("", parse("  -d 16\t-v   -I -5 -c /etc/qn.conf -abcdefghijklmno"));
+  const std::pair<const char*, const char*> lRefusals[] = {
+      {"-d16", "Unknown option '-d16'"},
+      {"-abcdefghijklmnop", "Unknown option '-abcdefghijklmnop'"},
+      {"start -v", "Unexpected argument 'start'"},
+      {"-d 16 17", "Unexpected argument '17'"},
+      {"-s -s", "Option '-s' given more than once"},
+  };
+  for (const auto& lrRefusal : lRefusals) {
+    EXPECT_EQ(lrRefusal.second, parse(lrRefusal.first));
+    EXPECT_EQ(QNCLPS_Failed, mParser.getState());
+  }
+  // A failed run keeps nothing of an earlier successful one: a handler would act on options that
+  // are not on the current line.
+  QNCPointer<QNCCommandLineArgument> lArgument;
+  EXPECT_EQ("Option '-d' is not on the command line",
+            thrown<QNCNotFoundEx>([&] { mParser.getArgument("-d", lArgument); }));
+  EXPECT_TRUE(lArgument.isNull());
+}
+
+// Conversions and decoding never produce a value the setting does not hold or the text does not
+// say; the old value stays.
+TEST(MultiTypeTest, WrongKindsAndBadTextsAreRefusedWithClearMessages) {
+  const QNCMultiType lText("/etc/qn.conf"), lFlag(static_cast<signed char>(1)), lNumber(16u);
+  EXPECT_EQ("Setting value holds text, not an unsigned integer",
+            thrown<QNCInvalidEx>([&] { (void)static_cast<unsigned int>(lText); }));
+  EXPECT_EQ("Setting value holds a signed byte, not an unsigned integer",
+            thrown<QNCInvalidEx>([&] { (void)static_cast<unsigned int>(lFlag); }));
+  EXPECT_EQ("Setting value holds an unsigned integer, not a signed byte",
+            thrown<QNCInvalidEx>([&] { (void)static_cast<signed char>(lNumber); }));
+  EXPECT_EQ("Setting value holds an unsigned integer, not text",
+            thrown<QNCInvalidEx>([&] { (void)lNumber.getText(); }));
+  QNCMultiType lValue(42u), lByte(static_cast<signed char>(3));
+  EXPECT_EQ("' 12' is not an unsigned integer", thrown<QNCInvalidEx>([&] { lValue.decode(" 12"); }));
+  EXPECT_EQ("'128' is not a signed byte", thrown<QNCInvalidEx>([&] { lByte.decode("128"); }));
+  EXPECT_EQ(42u, static_cast<unsigned int>(lValue));
+  EXPECT_EQ(3, static_cast<signed char>(lByte));
 }
 
 }  // namespace

@@ -132,8 +132,6 @@ class TableSystem : public QNCSystem {
 
   // Tables are filled before any thread uses them, as the contract requires.
   void addQueue(const QNCPointer<QNCSynchQueue>& acrQueue) { mQueues.append(acrQueue); }
-  void addReader(const QNCPointer<QNCReader>& acrReader) { mReaders.append(acrReader); }
-  void addWriter(const QNCPointer<QNCWriter>& acrWriter) { mWriters.append(acrWriter); }
 
   void addBucket(unsigned int aLength) { mMemoryBufferList.pushBack(aLength); }
   template <class T>

@@ -48,16 +48,9 @@ pid_t spawn(const std::vector<std::string>& acrArgv, const std::vector<std::stri
   std::vector<char*> lArgv;
   for (const auto& lArg : acrArgv) lArgv.push_back(const_cast<char*>(lArg.c_str()));
   lArgv.push_back(nullptr);
-  std::vector<std::string> lEnvStore;
-  for (char** lpEntry = environ; *lpEntry != nullptr; ++lpEntry) {
-    const std::string lEntry = *lpEntry;
-    bool lOverridden = false;
-    for (const auto& lExtra : acrEnv) {
-      if (lEntry.compare(0, lExtra.find('=') + 1, lExtra, 0, lExtra.find('=') + 1) == 0) lOverridden = true;
-    }
-    if (!lOverridden) lEnvStore.push_back(lEntry);
-  }
-  for (const auto& lExtra : acrEnv) lEnvStore.push_back(lExtra);
+  // The extra entries first: getenv finds them before an inherited entry of the same name.
+  std::vector<std::string> lEnvStore = acrEnv;
+  for (char** lpEntry = environ; *lpEntry != nullptr; ++lpEntry) lEnvStore.push_back(*lpEntry);
   std::vector<char*> lEnv;
   for (auto& lEntry : lEnvStore) lEnv.push_back(const_cast<char*>(lEntry.c_str()));
   lEnv.push_back(nullptr);
