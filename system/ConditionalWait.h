@@ -13,23 +13,46 @@
 
 #include <chrono>
 
+#include "Assert.h"
 #include "Conditional.h"
 #include "Logger.h"
 #include "QNException.h"
 #include "System.h"
 
+// The numbered services read the trace level once per call and pass it on.
+#define QN_TRACE_IF(aOn, apText)                                                                          \
+  do {                                                                                                    \
+    if (aOn) PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, __func__, __FILE__, "%s", apText); \
+  } while (0)
+#define QN_LEFT_IF(aOn) QN_TRACE_IF(aOn, "Left")
+
+// Entry aNo of a numbered table, its number asserted first with the text apCondition (which names
+// the caller's argument and table). An entry that was never set still meets the pointer's own
+// assertion ("0 != mPointer"); a set one costs a single test. Always inline: it is on every
+// hand-off's path, and the compiler would otherwise call it for its six arguments.
+template <class T>
+__attribute__((always_inline)) inline T& QNNumbered(const QNCVector<QNCPointer<T>>& acrTable,
+                                                    unsigned int aNo, const char* apCondition, int aLine,
+                                                    const char* apFunction, const char* apFile) {
+  if (__builtin_expect(aNo >= acrTable.numberOfElements(), 0))
+    QNAssertionFailed(apCondition, aLine, apFunction, apFile);
+  const QNCPointer<T>& lrEntry = acrTable[aNo];
+  T* const lpEntry = lrEntry.get();
+  return __builtin_expect(lpEntry != nullptr, 1) ? *lpEntry : *lrEntry;
+}
+
 // Waits on arConditional until acrReady() (QNWS_Ready) or acrExit() (QNWS_Exit) holds, testing
 // them in that order before every wait, or until aLimitMs milliseconds have passed (QNWS_TimedOut;
 // negative: no limit). With aOnce it waits once whatever the tests say and returns QNWS_Ready after the
-// wake-up; a time-out then throws QNCTimeOutEx (wait, timedWait). Traces the conditional's steps,
-// and apWaitTrace before each wait, under the caller's function name apFunction.
+// wake-up; a time-out then throws QNCTimeOutEx (wait, timedWait). With aTrace (the caller reads
+// the trace level once per call) it traces the conditional's steps, and apWaitTrace before each
+// wait, under the caller's function name apFunction.
 template <class Ready, class Exit>
 QNEWaitStatus QNWaitOnConditional(QNCConditional& arConditional, const Ready& acrReady, const Exit& acrExit,
                                   long long aLimitMs, bool aOnce, const char* apWaitTrace,
-                                  const char* apFunction) {
-  const auto lTrace = [apFunction](const char* apText) {
-    if (QNIsLogLevelOn(QNLL_Trace))
-      PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, apFunction, __FILE__, "%s", apText);
+                                  const char* apFunction, bool aTrace) {
+  const auto lTrace = [apFunction, aTrace](const char* apText) {
+    if (aTrace) PrintLogMessageWithTimeStamp(QNLL_Trace, "-T-", __LINE__, apFunction, __FILE__, "%s", apText);
   };
   // Without a limit the clock is not read at all.
   const auto lDeadline = aLimitMs < 0

@@ -21,15 +21,17 @@ QNCPointer<QNCWriter>& QNCSystem::getWriter(unsigned int acWriterNo) {
 }
 
 void QNCSystem::signal(unsigned int acConditionNo) {
-  QN_ENTERED();
-  QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
-  QNCConditional& lConditional = *mWaitConditionals[acConditionNo];
+  const bool lTrace = QNIsLogLevelOn(QNLL_Trace);
+  QN_TRACE_IF(lTrace, "Entered");
+  QNCConditional& lConditional =
+      QNNumbered(mWaitConditionals, acConditionNo,
+                 "acConditionNo < this->mWaitConditionals.numberOfElements()", __LINE__, __func__, __FILE__);
   // Nobody between lock() and unlock() of the conditional: no thread waits, and none has tested
   // its list or queue before the caller's enlist/enqueue (a waiter counts itself before its
   // test, and that change was made before this read; Conditional.h gives the ordering), so a
   // later waiter will find the element and the wake-up can be skipped. With the trace level on,
   // the signal passes the lock every time, as it always did.
-  if (lConditional.hasWaiters() || QNIsLogLevelOn(QNLL_Trace)) {
+  if (lConditional.hasWaiters() || lTrace) {
     // A waiter that has found its queue or list empty holds this lock until it is inside the
     // wait. Passing through the lock therefore orders this signal after that waiter's wait has
     // begun, so it cannot fall between the waiter's test and its wait and be lost. The signal
@@ -39,7 +41,7 @@ void QNCSystem::signal(unsigned int acConditionNo) {
     lConditional.unlock();
     lConditional.signal();
   }
-  QN_LEFT();
+  QN_LEFT_IF(lTrace);
 }
 
 // wait and timedWait: one wait whatever the state, through the scaffold of ConditionalWait.h,
@@ -48,7 +50,7 @@ void QNCSystem::wait(unsigned int acConditionNo) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
   QNWaitOnConditional(*mWaitConditionals[acConditionNo], kNever, kNever, -1, true,
-                      "Going to wait on conditional", __func__);
+                      "Going to wait on conditional", __func__, QNIsLogLevelOn(QNLL_Trace));
   QN_LEFT();
 }
 
@@ -56,7 +58,7 @@ void QNCSystem::timedWait(unsigned int acConditionNo, unsigned int aWaitTime) {
   QN_ENTERED();
   QN_ASSERT(acConditionNo < this->mWaitConditionals.numberOfElements());
   QNWaitOnConditional(*mWaitConditionals[acConditionNo], kNever, kNever, aWaitTime, true,
-                      "Going to wait on conditional", __func__);
+                      "Going to wait on conditional", __func__, QNIsLogLevelOn(QNLL_Trace));
   QN_LEFT();
 }
 
