@@ -11,6 +11,18 @@ const auto kNever = [] { return false; };
 
 // The exit-aware waits take 0 for "no time limit"; the scaffold takes a negative limit.
 long long noLimitIfZero(unsigned int aMaxWaitMs) { return aMaxWaitMs == 0 ? -1 : aMaxWaitMs; }
+
+// The exit-aware takes' wait, out of line: a take that finds an element at once then sets up
+// neither the wait's frame nor its exception handling.
+template <class Take>
+__attribute__((noinline)) QNEWaitStatus waitToTake(QNCSystem& arSystem, QNCConditional& arConditional,
+                                                   const Take& acrTake, unsigned int aMaxWaitMs,
+                                                   const char* apWaitTrace, const char* apFunction,
+                                                   bool aTrace) {
+  return QNWaitOnConditional(
+      arConditional, acrTake, [&arSystem] { return arSystem.isSetForExit(); }, noLimitIfZero(aMaxWaitMs),
+      false, apWaitTrace, apFunction, aTrace);
+}
 }  // namespace
 
 // The shape of every numbered list and queue service: the trace level is read once, "Entered" is
@@ -200,9 +212,8 @@ QNEWaitStatus QNCSystem::delistOrExit(unsigned int acConditionNo, unsigned int a
   // lock, so no other consumer comes between the test and the take.
   QNEWaitStatus lStatus = QNWS_Ready;
   if (!lrElement.tryDelist(arElement))
-    lStatus = QNWaitOnConditional(
-        *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDelist(arElement); },
-        [this] { return isSetForExit(); }, noLimitIfZero(aMaxWaitMs), false,
+    lStatus = waitToTake(
+        *this, *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDelist(arElement); }, aMaxWaitMs,
         "List empty... Going to wait on conditional", __func__, lTrace);
   QN_LEFT_IF(lTrace);
   return lStatus;
@@ -214,9 +225,8 @@ QNEWaitStatus QNCSystem::dequeueOrExit(unsigned int acConditionNo, unsigned int 
   arElement.reset();  // tryDequeue does it too, but a derived queue may override it
   QNEWaitStatus lStatus = QNWS_Ready;
   if (!lrElement.tryDequeue(arElement))
-    lStatus = QNWaitOnConditional(
-        *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDequeue(arElement); },
-        [this] { return isSetForExit(); }, noLimitIfZero(aMaxWaitMs), false,
+    lStatus = waitToTake(
+        *this, *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDequeue(arElement); }, aMaxWaitMs,
         "Queue empty... Going to wait on conditional", __func__, lTrace);
   QN_LEFT_IF(lTrace);
   return lStatus;
