@@ -5,11 +5,11 @@
 //
 // The tests run under the conditional's lock, and signal() and makeThreadsToExit() pass through
 // that lock before they wake waiters, so a change made before either cannot fall between a test
-// and the wait and be lost. signal() skips the lock and the wake-up only when no thread is
-// between the conditional's lock() and unlock(): the waiter counts itself in lock(), before its
-// first test, so none can then be between a test that missed the change and its wait
-// (Conditional.h). Lock order: the conditional's lock, then inside it whatever the tests take (a
-// list's or queue's lock, mExitLock); never the reverse.
+// and the wait and be lost. signal() skips the lock and the wake-up only when no waiter is
+// counted: the waiter counts itself in lock(), before its first test, and stops counting only
+// for the first test after a wake-up, which ends the wait when it succeeds; so none can then be
+// between a test that missed the change and its wait (Conditional.h). Lock order: the conditional's lock,
+// then inside it whatever the tests take (a list's or queue's lock, mExitLock); never the reverse.
 
 #include <chrono>
 
@@ -89,6 +89,19 @@ QNEWaitStatus QNWaitOnConditional(QNCConditional& arConditional, const Ready& ac
         }
       }
       if (aOnce) break;
+      // Woken, most often by a hand-over: the first test runs uncounted (Conditional.h), so a
+      // producer that hands over meanwhile does not queue on the lock held here. The count is
+      // back before any test that a further wait may follow, and before an exception leaves.
+      arConditional.uncount();
+      bool lReady = false;
+      try {
+        lReady = acrReady();
+      } catch (...) {
+        arConditional.recount();
+        throw;
+      }
+      arConditional.recount();
+      if (lReady) break;
     }
   } catch (...) {
     lTrace("Unlocking the wait conditional");

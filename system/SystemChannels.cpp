@@ -37,8 +37,9 @@ void QNCSystem::signal(unsigned int acConditionNo) {
     // begun, so it cannot fall between the waiter's test and its wait and be lost. The signal
     // itself is given after the unlock: a thread woken while the lock is still held would only
     // block again on it, which costs a second sleep and wake-up per hand-off.
-    lConditional.lock();
-    lConditional.unlock();
+    // The signaller does not count itself as a waiter, so other producers do not take the lock
+    // on its account.
+    lConditional.passLock();
     lConditional.signal();
   }
   QN_LEFT_IF(lTrace);
