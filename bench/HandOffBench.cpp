@@ -9,7 +9,8 @@
 //   floor       what the exit-aware take's contract requires, written with the standard library:
 //               the list's own mutex for every hand-over and take, the conditional's mutex only
 //               for a consumer that found the list empty (it counts itself before its test, and a
-//               producer that sees nobody counted takes no other lock), the exit flag read under
+//               producer that sees nobody counted takes no other lock; a woken consumer's first
+//               test runs uncounted), the exit flag read under
 //               its own mutex before each wait. The elements sit in a std::list, as the list's
 //               iterators (listBegin, listErase) require, whose nodes are recycled through a
 //               bounded spare list, as the library's are, so that a steady hand-off allocates
@@ -139,7 +140,13 @@ class Floor {
     if (_tryTake(lrChannel, lElement)) return lElement;
     lrChannel.mWaiters.fetch_add(1);
     std::unique_lock<std::mutex> lGuard(lrChannel.mConditionMutex);
-    while (!_tryTake(lrChannel, lElement) && !_isSetForExit()) lrChannel.mNotEmpty.wait(lGuard);
+    while (!_tryTake(lrChannel, lElement) && !_isSetForExit()) {
+      lrChannel.mNotEmpty.wait(lGuard);
+      lrChannel.mWaiters.fetch_sub(1);  // the first test after a wake-up runs uncounted
+      const bool lTaken = _tryTake(lrChannel, lElement);
+      lrChannel.mWaiters.fetch_add(1);
+      if (lTaken) break;
+    }
     lGuard.unlock();
     lrChannel.mWaiters.fetch_sub(1);
     return lElement;

@@ -39,7 +39,17 @@ class QNCSynchList {
 
   // Add acrElement at the tail / at the head. Throw QNCNoMemoryEx "Out of Memory" (2) when no
   // node can be allocated; the list is then unchanged.
-  void enlist(const QNCPointer<QNCQueueable>& acrElement);
+  void enlist(const QNCPointer<QNCQueueable>& acrElement) {
+    // The element's counter is taken and a node allocated (when no spare node is at hand) before
+    // the lock: a failed allocation leaves the list untouched, and other threads do not wait
+    // behind the allocator. Declared before the guard, lElement and lNode are released after the
+    // unlock. Inline, as tryDelist: these two are the hand-off's hot path.
+    QNCPointer<QNCQueueable> lElement(acrElement);
+    QNCSpareNodes::Node lNode;
+    mSpares.prepare(lElement, lNode);
+    QNCMutexLocker lGuard(_mutex());
+    mSpares.insert(mList, mList.end(), lNode, lElement);
+  }
   void enlistFront(const QNCPointer<QNCQueueable>& acrElement);
 
   // Remove the head / the tail element and hand it to the caller. Throw QNCNotFoundEx
@@ -49,7 +59,16 @@ class QNCSynchList {
   // delist() without the exception: false (arElement then empty) when the list is empty. One
   // pass through the lock and no allocation; arElement's former object is released before the
   // lock is taken.
-  bool tryDelist(QNCPointer<QNCQueueable>& arElement);
+  bool tryDelist(QNCPointer<QNCQueueable>& arElement) {
+    // The head is moved into arElement under the lock (no counter traffic) and its node kept as
+    // a spare (one beyond the spares' bound is freed with lFreed after the lock).
+    arElement.reset();
+    QNCSpareNodes::Node lFreed;
+    QNCMutexLocker lGuard(_mutex());
+    if (mList.isEmpty()) return false;
+    mSpares.take(mList, mList.begin(), arElement, lFreed);
+    return true;
+  }
 
   // A copy of the head element, made under the lock. Throws QNCNotFoundEx "Not Found" (8) when
   // the list is empty.
@@ -70,6 +89,9 @@ class QNCSynchList {
   Elements::const_iterator end() const { return mList.end(); }
 
  private:
+  // Never empty: the constructor throws when it cannot make the mutex.
+  QNCMutex& _mutex() { return *mMutex.get(); }
+
   Elements mList;
   QNCPointer<QNCMutex> mMutex;  // guards mList and mSpares
   QNCSpareNodes mSpares;

@@ -90,8 +90,9 @@ class QNCSystem : public QNCSystemInterface {
   // test and its wait (see waitOnEmptyList): a producer's enlist/enqueue followed by signal()
   // always wakes a waiter that found the list or queue empty. The caller must not hold that
   // conditional's lock itself. Blocks only for the lock.
-  // When no thread is between the conditional's lock() and unlock() (QNCConditional::hasWaiters)
-  // it takes no lock and wakes nobody: every waiter counts itself there before it tests, so none
+  // When no waiter is counted on the conditional (QNCConditional::hasWaiters) it takes no lock
+  // and wakes nobody: every waiter counts itself in lock() before a test that a wait may follow
+  // (a woken waiter's first test runs uncounted, and ends its wait when it succeeds), so none
   // can have missed what the caller changed before the call, provided the change and the test
   // meet under one lock (the list's or queue's, as in every wait of this class, or the
   // conditional's) or in sequentially consistent atomics. With the trace level on it passes

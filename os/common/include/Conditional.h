@@ -8,17 +8,23 @@
 // while nobody waits is lost, not remembered for a later wait. Timed waits measure against the
 // monotonic clock. None of the operations logs.
 //
-// Waiters are counted: every thread between its lock() and its unlock() is one, from before it
-// holds the mutex (so from before its first test of the condition) until it has given the
-// mutex up, whether it runs, waits for the mutex or sleeps in wait(). hasWaiters() lets a thread
-// that has just made the condition true skip the wake-up when nobody can need it. That is safe
-// when the change is ordered before hasWaiters() and after any test that a waiter made
-// (Dekker's pattern): a waiter counts itself (sequentially consistent) before its test, and the
-// changer reads the count (sequentially consistent) after its change. If the change and the
-// test are made under one lock (this conditional's, or a list's), a test that missed the change
-// came first in that lock's order, so its count is visible to the changer's read; the same holds
-// for a condition kept in sequentially consistent atomics. If the read gives 0, every later
-// waiter tests after the change and sees it.
+// Waiters are counted: every thread between its lock() and its unlock() is one (but for the
+// uncounted test below), from before it holds the mutex (so from before its first test of the
+// condition) until it has given the mutex up, whether it runs, waits for the mutex or sleeps in
+// wait(). hasWaiters() lets a thread that has just made the condition true skip the wake-up when
+// nobody can need it. That is safe when the change is ordered before hasWaiters() and after any
+// test that a waiter made (Dekker's pattern): a waiter counts itself (sequentially consistent)
+// before its test, and the changer reads the count (sequentially consistent) after its change. If
+// the change and the test are made under one lock (this conditional's, or a list's), a test that
+// missed the change came first in that lock's order, so its count is visible to the changer's read;
+// the same holds for a condition kept in sequentially consistent atomics. If the read gives 0,
+// every later waiter tests after the change and sees it.
+//
+// A waiter that has just been woken may stop counting itself for one test that ends its wait
+// when it succeeds (uncount(), then recount() before unlock() or before any test that a further
+// wait may follow): a changer that comes meanwhile then passes by without the lock, which the
+// woken waiter holds. A thread that only passes the lock to order a wake-up (passLock()) is not
+// counted.
 
 #include <atomic>
 
@@ -50,8 +56,18 @@ class QNCConditional {
     mWaiters.fetch_sub(1, std::memory_order_seq_cst);
   }
 
-  // True while any thread is between lock() and unlock(). Never blocks, never throws.
+  // True while any thread is between lock() and unlock() and counted. Never blocks, never throws.
   bool hasWaiters() const noexcept { return mWaiters.load(std::memory_order_seq_cst) != 0; }
+  // For the holder of the mutex, woken from wait(): stop counting it / count it again (above).
+  void uncount() noexcept { mWaiters.fetch_sub(1, std::memory_order_seq_cst); }
+  void recount() noexcept { mWaiters.fetch_add(1, std::memory_order_seq_cst); }
+  // Takes and releases the mutex without counting the caller as a waiter: a thread that has
+  // changed the condition waits so until no waiter is between its test and its wait. Blocks only
+  // for the mutex.
+  void passLock() {
+    mMutex.lock();
+    mMutex.unlock();
+  }
 
   // The caller holds the mutex; it is released while the thread waits and held again on return.
   // Blocks until signalled (or woken spuriously).
