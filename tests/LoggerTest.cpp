@@ -120,8 +120,8 @@ TEST_F(LoggerTest, ChildForkedAfterCreateLoggerDoesNotRepeatTheParentsLines) {
   EXPECT_EQ(1u, countOf(lLog, "from the child")) << lLog;
 }
 
-// Scenarios that need a process of their own (qn_test_helper's log- modes): the state before
-// CreateLogger, exit and crashes.
+// Scenarios that need a process of their own (qn_test_helper's log- modes): exit and crashes.
+// (Lines before CreateLogger: the driver's and qnsensord's start-up, the death tests.)
 class LoggerProcessTest : public ::testing::Test {
  protected:
   int run(const std::string& acrMode, const std::string& acrLog, const std::string& acrExtra = "") {
@@ -129,26 +129,10 @@ class LoggerProcessTest : public ::testing::Test {
     if (!acrExtra.empty()) lArgs.push_back(acrExtra);
     return qntest::waitExit(qntest::spawnHelper(lArgs, mDir.file("stdout"), mDir.file("stderr")));
   }
-  std::string stdErr() const { return qntest::readFile(mDir.file("stderr")); }
 
   qntest::TempDir mDir;
   std::string mLog = mDir.file("probe.log");
 };
-
-TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
-  ASSERT_EQ(0, run("startup", mLog));
-  const std::string lLog = qntest::readFile(mLog);
-  EXPECT_EQ(4u, linesOf(lLog).size()) << lLog;
-  EXPECT_EQ("-T-", qntest::levelOf(lLog, ") early trace 1"));
-  qntest::expectInOrder(
-      lLog, {") early trace 1\n", ") early error 3\n", ") early warning 4\n", ") after open 5\n"});
-  // Urgent lines went to standard error at once, before and after the log; nothing else did.
-  const std::string lStderr = stdErr();
-  for (const char* lpUrgent : {"early error 3", "early warning 4", "after destroy 7"})
-    EXPECT_EQ(1u, countOf(lStderr, lpUrgent)) << lpUrgent;
-  EXPECT_EQ(3u, linesOf(lStderr).size()) << lStderr;
-  EXPECT_EQ(0u, countOf(lStderr, "-T-"));
-}
 
 // exit(1) right after 1000 lines while another thread keeps logging: the exit handler writes
 // every buffered line and does not deadlock against the logging thread. (An assertion's exit

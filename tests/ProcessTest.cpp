@@ -254,6 +254,11 @@ TEST_P(DriverSignalTest, SignalShutsDownInOrder) {
   EXPECT_NE(std::string::npos, output().find("exit request 1 self\n"))
       << "the handler must reach the registered object, which must still be registered";
   EXPECT_NE(std::string::npos, output().find("SystemMain returned\n"));
+  // After the log is closed an urgent line still reaches standard error, the only line there
+  // (a trace is dropped).
+  const std::string lErr = readFile(mDir.file("stderr"));
+  EXPECT_EQ(1u, qntest::countOf(lErr, "\n")) << lErr;
+  EXPECT_NE(std::string::npos, lErr.find(") urgent after the log was closed\n")) << lErr;
 }
 
 INSTANTIATE_TEST_SUITE_P(EachShutDownSignal, DriverSignalTest, ::testing::Values(SIGTERM, SIGINT, SIGHUP),

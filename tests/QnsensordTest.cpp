@@ -203,8 +203,11 @@ TEST_F(QnsensordTest, CommandLineIsCheckedWholeBeforeAnythingStarts) {
   for (const auto& [lrArguments, lStatus, lrText] : lCases) {
     const Run lRun = run(lrArguments);
     EXPECT_EQ(lStatus, lRun.mStatus) << lrText;
+    // A success prints the text alone and nothing on standard error (not even a line logged
+    // before the log is open); a usage error only says what is wrong.
     EXPECT_EQ(lStatus == 0 ? lrText : "", lRun.mStdout);
-    EXPECT_NE(std::string::npos, (lRun.mStdout + lRun.mStderr).find(lrText)) << lRun.mStderr;
+    EXPECT_EQ(lStatus == 0, lRun.mStderr.empty()) << lRun.mStderr;
+    EXPECT_EQ(lStatus != 0, lRun.mStderr.find(lrText) != std::string::npos) << lRun.mStderr;
     EXPECT_EQ("", lRun.mLog);
     EXPECT_FALSE(hasPidFile());
   }
