@@ -36,12 +36,6 @@ void say(const std::string& acrText) {
   (void)!write(STDOUT_FILENO, lLine.data(), lLine.size());
 }
 
-// Bounded, so a test that fails before creating the file leaves nothing behind for long.
-void waitForFile(const char* apPath) {
-  for (int lTry = 0; lTry < 3000 && access(apPath, F_OK) != 0; ++lTry)
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
-}
-
 int instance(const std::string& acrMode, int argc, char** argv) {
   // SIGTERM is blocked before any thread exists, so only sigwait() below ever takes it.
   sigset_t lTerm;
@@ -55,10 +49,11 @@ int instance(const std::string& acrMode, int argc, char** argv) {
   CreateLogger(QNCString(argv[3]));
   qntest::TableSystem lSystem(0, 0, 0);
   lSystem.usePidFile(argv[2]);
-  if (argc > 4) waitForFile(argv[4]);
+  // Bounded, so a test that fails before creating the go-file leaves nothing behind for long.
+  for (int lTry = 0; argc > 4 && lTry < 3000 && access(argv[4], F_OK) != 0; ++lTry)
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
   if (acrMode == "kill") {
     lSystem.killRunningInstance();
-    say("kill returned");
   } else {
     lSystem.markAsRunning();
     lSystem.getProcStatus(QNCString(argv[2]));
