@@ -77,33 +77,21 @@ TEST_F(LoggerTest, EveryMessageBecomesOneWellFormedBoundedLine) {
   EXPECT_EQ("first second", messageOf(lLines[4]));
 }
 
-// Urgent lines, and whatever flushLogger() finds buffered, are in the file when the call returns.
-TEST_F(LoggerTest, UrgentOrFlushedLineIsInTheFileWhenTheCallReturns) {
-  QN_LOG_TRACE("buffered before");
-  const std::pair<QNELogLevel, const char*> lUrgent[] = {
-      {QNLL_Halt, "-H-"}, {QNLL_Error, "-E-"}, {QNLL_Warning, "-W-"}};
-  for (const auto& lrUrgent : lUrgent) {
-    const std::string lText = std::string("urgent ") + lrUrgent.second;
-    PrintLogMessageWithTimeStamp(lrUrgent.first, lrUrgent.second, __LINE__, __func__, __FILE__, "%s",
-                                 lText.c_str());
-    const std::string lLog = qntest::readFile(mLogPath);
-    EXPECT_NE(std::string::npos, lLog.find(lText)) << lLog;
-    // Order is kept: what was buffered before the urgent line is written with it.
-    EXPECT_LT(lLog.find("buffered before"), lLog.find(lText));
-  }
-  for (int lIndex = 0; lIndex < 10; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
-  flushLogger();
-  EXPECT_EQ(14u, linesOf(qntest::readFile(mLogPath)).size());
-}
-
+// Urgent lines are in the file when the call returns, with what was buffered before them.
 // Regression: a child forked while lines sat in the buffer wrote them again at its exit, so the
 // parent's lines appeared twice in the log.
-TEST_F(LoggerTest, ChildForkedAfterCreateLoggerDoesNotRepeatTheParentsLines) {
+TEST_F(LoggerTest, UrgentLinesWriteThroughAndAForkedChildDoesNotRepeatTheParentsLines) {
   QN_LOG_TRACE("parent before fork");
   // Once the flusher has written the line (with no further call) it idles; a fork while it was
   // still starting up could copy a sanitizer's allocator lock held, and the child would hang in
   // its exit-time leak check.
   ASSERT_TRUE(qntest::waitForText(mLogPath, "parent before fork"));
+  QN_LOG_TRACE("buffered before");
+  for (const auto& [lLevel, lpTag] :
+       {std::pair<QNELogLevel, const char*>{QNLL_Halt, "-H-"}, {QNLL_Error, "-E-"}, {QNLL_Warning, "-W-"}}) {
+    PrintLogMessageWithTimeStamp(lLevel, lpTag, __LINE__, __func__, __FILE__, "urgent %s", lpTag);
+    qntest::expectInOrder(qntest::readFile(mLogPath), {"buffered before", std::string("urgent ") + lpTag});
+  }
   QN_LOG_TRACE("parent buffered at the fork");
   const pid_t lChild = fork();
   ASSERT_GE(lChild, 0);
@@ -115,13 +103,13 @@ TEST_F(LoggerTest, ChildForkedAfterCreateLoggerDoesNotRepeatTheParentsLines) {
   ASSERT_EQ(lChild, waitpid(lChild, &lStatus, 0));
   EXPECT_TRUE(WIFEXITED(lStatus) && WEXITSTATUS(lStatus) == 0);
   const std::string lLog = log();
-  EXPECT_EQ(1u, countOf(lLog, "parent before fork")) << lLog;
-  EXPECT_EQ(1u, countOf(lLog, "parent buffered at the fork")) << lLog;
-  EXPECT_EQ(1u, countOf(lLog, "from the child")) << lLog;
+  for (const char* lpLine :
+       {"parent before fork", "buffered before", "parent buffered at the fork", "from the child"})
+    EXPECT_EQ(1u, countOf(lLog, lpLine)) << lpLine << " in:\n" << lLog;
 }
 
-// Scenarios that need a process of their own (qn_test_helper's log- modes): the state before
-// CreateLogger, exit and crashes.
+// Scenarios that need a process of their own (qn_test_helper's log- modes): exit and crashes.
+// (Lines before CreateLogger: the driver's and qnsensord's start-up, the death tests.)
 class LoggerProcessTest : public ::testing::Test {
  protected:
   int run(const std::string& acrMode, const std::string& acrLog, const std::string& acrExtra = "") {
@@ -129,26 +117,10 @@ class LoggerProcessTest : public ::testing::Test {
     if (!acrExtra.empty()) lArgs.push_back(acrExtra);
     return qntest::waitExit(qntest::spawnHelper(lArgs, mDir.file("stdout"), mDir.file("stderr")));
   }
-  std::string stdErr() const { return qntest::readFile(mDir.file("stderr")); }
 
   qntest::TempDir mDir;
   std::string mLog = mDir.file("probe.log");
 };
-
-TEST_F(LoggerProcessTest, StartUpLinesOpenTheLogFilteredByTheMaskThenInForce) {
-  ASSERT_EQ(0, run("startup", mLog));
-  const std::string lLog = qntest::readFile(mLog);
-  EXPECT_EQ(4u, linesOf(lLog).size()) << lLog;
-  EXPECT_EQ("-T-", qntest::levelOf(lLog, ") early trace 1"));
-  qntest::expectInOrder(
-      lLog, {") early trace 1\n", ") early error 3\n", ") early warning 4\n", ") after open 5\n"});
-  // Urgent lines went to standard error at once, before and after the log; nothing else did.
-  const std::string lStderr = stdErr();
-  for (const char* lpUrgent : {"early error 3", "early warning 4", "after destroy 7"})
-    EXPECT_EQ(1u, countOf(lStderr, lpUrgent)) << lpUrgent;
-  EXPECT_EQ(3u, linesOf(lStderr).size()) << lStderr;
-  EXPECT_EQ(0u, countOf(lStderr, "-T-"));
-}
 
 // exit(1) right after 1000 lines while another thread keeps logging: the exit handler writes
 // every buffered line and does not deadlock against the logging thread. (An assertion's exit

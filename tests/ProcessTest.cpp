@@ -13,6 +13,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
@@ -42,17 +43,18 @@ std::string pidBytes(int aPid) {
 class InstanceTest : public ::testing::Test {
  protected:
   struct Tool {
-    pid_t mPid;
+    qntest::Child mChild;
     std::string mOut, mErr, mLog;
   };
 
   // Starts the helper in an instance mode; given acrReady, waits until it has printed that word.
   Tool start(const std::string& acrMode, const std::string& acrReady = "", const std::string& acrGo = "") {
     const std::string lName = "tool" + std::to_string(mCount++);
-    Tool lTool{0, mDir.file(lName + ".out"), mDir.file(lName + ".err"), mDir.file(lName + ".log")};
+    Tool lTool{qntest::Child(), mDir.file(lName + ".out"), mDir.file(lName + ".err"),
+               mDir.file(lName + ".log")};
     std::vector<std::string> lArgs = {acrMode, mPidFile, lTool.mLog};
     if (!acrGo.empty()) lArgs.push_back(acrGo);
-    lTool.mPid = qntest::spawnHelper(lArgs, lTool.mOut, lTool.mErr);
+    lTool.mChild = qntest::Child(qntest::spawnHelper(lArgs, lTool.mOut, lTool.mErr));
     if (!acrReady.empty()) {
       EXPECT_TRUE(qntest::waitForText(lTool.mOut, acrReady)) << readFile(lTool.mErr);
     }
@@ -115,30 +117,6 @@ TEST_F(InstanceTest, StartInTheReopeningGapNeverLeavesTheFileNamingTheWrongProce
   close(lIntruderFd);
 }
 
-// The first instance asks getProcStatus() about its own PID file, which opens and closes it: were
-// the lock a classic fcntl lock, owned by the process, that close would release it and the second
-// start would succeed. The second start is refused at once; "kill" ends the first by SIGTERM.
-TEST_F(InstanceTest, FirstStartHoldsTheFileSecondFailsAndKillEndsTheFirst) {
-  // (The file's mode under a daemon's umask: DaemonStartTest.)
-  Tool lFirst = start("hold", "running");
-  EXPECT_EQ(pidBytes(lFirst.mPid), readFile(mPidFile));
-
-  Tool lSecond = start("hold");
-  EXPECT_EQ(1, qntest::waitExit(lSecond.mPid, seconds(10)));
-  EXPECT_EQ("error: Cannot mark running.. found another instance (code 10)\n", readFile(lSecond.mErr));
-  EXPECT_NE(std::string::npos, readFile(lSecond.mLog).find("Another instance is already running"));
-  EXPECT_EQ(pidBytes(lFirst.mPid), readFile(mPidFile));
-
-  Tool lKiller = start("kill");
-  EXPECT_EQ(0, qntest::waitExit(lKiller.mPid)) << readFile(lKiller.mErr);
-  EXPECT_EQ(0, qntest::waitExit(lFirst.mPid)) << "the instance did not end on SIGTERM by itself";
-  EXPECT_NE(std::string::npos,
-            readFile(lKiller.mLog)
-                .find("Instance with pid : " + std::to_string(lFirst.mPid) + " is terminated successfully"));
-  EXPECT_FALSE(lockedByOther(mPidFile));
-  EXPECT_EQ(pidBytes(lFirst.mPid), readFile(mPidFile));  // never deleted or cleared
-}
-
 // Also pins a lost id: A and B find no file; A creates it, locks, writes its id and runs on; B's
 // creating open then truncated the file to nothing before B found the lock held and gave up.
 TEST_F(InstanceTest, TwentySimultaneousStartsLeaveExactlyOneRunning) {
@@ -146,36 +124,23 @@ TEST_F(InstanceTest, TwentySimultaneousStartsLeaveExactlyOneRunning) {
   std::vector<Tool> lTools;
   for (int lIndex = 0; lIndex < 20; ++lIndex) lTools.push_back(start("hold", "", lGo));
   qntest::writeFile(lGo, "");
-  // The losers end by themselves with an error of the family; the winner runs until stopped. The
-  // file may name a loser for a moment, so the winner is found by who keeps running.
-  std::vector<int> lStatus(lTools.size(), -1);
-  size_t lEnded = 0;
-  const auto lDeadline = std::chrono::steady_clock::now() + seconds(60);
-  while (lEnded + 1 < lTools.size() && std::chrono::steady_clock::now() < lDeadline) {
-    for (size_t lIndex = 0; lIndex < lTools.size(); ++lIndex) {
-      int lRaw = 0;
-      if (lStatus[lIndex] == -1 && waitpid(lTools[lIndex].mPid, &lRaw, WNOHANG) == lTools[lIndex].mPid) {
-        lStatus[lIndex] = WIFEXITED(lRaw) ? WEXITSTATUS(lRaw) : 128 + WTERMSIG(lRaw);
-        ++lEnded;
-      }
-    }
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-  }
+  // The winner says so and runs until stopped; the losers end by themselves with an error of
+  // the family (a second winner would run on and be killed at the time-out). The file may name
+  // a loser for a moment, so it is read once they have all ended.
   const Tool* lpWinner = nullptr;
-  for (size_t lIndex = 0; lIndex < lTools.size(); ++lIndex) {
-    if (lStatus[lIndex] == -1) {
-      EXPECT_EQ(nullptr, lpWinner) << "two starts are running";
-      lpWinner = &lTools[lIndex];
-    } else {
-      EXPECT_EQ(1, lStatus[lIndex]);
-      EXPECT_EQ(0u, readFile(lTools[lIndex].mErr).find("error: ")) << readFile(lTools[lIndex].mErr);
-    }
-  }
+  for (int lTry = 0; lTry < 3000 && lpWinner == nullptr; ++lTry, usleep(20 * 1000))
+    for (const Tool& lrTool : lTools)
+      if (readFile(lrTool.mOut).find("running") != std::string::npos) lpWinner = &lrTool;
   ASSERT_NE(nullptr, lpWinner) << "no start is running";
-  EXPECT_TRUE(qntest::waitForText(lpWinner->mOut, "running"));
-  EXPECT_EQ(pidBytes(lpWinner->mPid), readFile(mPidFile));
-  kill(lpWinner->mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lpWinner->mPid));
+  const auto lDeadline = std::chrono::steady_clock::now() + seconds(10);  // for all of them
+  for (Tool& lrTool : lTools) {
+    if (&lrTool == lpWinner) continue;
+    const auto lLeft =
+        std::chrono::duration_cast<std::chrono::milliseconds>(lDeadline - std::chrono::steady_clock::now());
+    EXPECT_EQ(1, lrTool.mChild.exit(std::max(lLeft, std::chrono::milliseconds(0))));
+    EXPECT_EQ(0u, readFile(lrTool.mErr).find("error: ")) << readFile(lrTool.mErr);
+  }
+  EXPECT_EQ(pidBytes(lpWinner->mChild.pid()), readFile(mPidFile));
 }
 
 // Takes about ten seconds: ten lock attempts one second apart. The instance that would not stop
@@ -184,19 +149,21 @@ TEST_F(InstanceTest, KillGivesUpOnAnInstanceIgnoringSigtermAndSigkillFreesTheFil
   Tool lStubborn = start("hold-stubborn", "running");
   qntest::writeFile(mPidFile, readFile(mPidFile) + "extra");
   Tool lKiller = start("kill");
-  EXPECT_EQ(0, qntest::waitExit(lKiller.mPid, seconds(30))) << readFile(lKiller.mErr);
+  EXPECT_EQ(0, lKiller.mChild.exit(seconds(30))) << readFile(lKiller.mErr);
   const std::string lLog = readFile(lKiller.mLog);
   EXPECT_NE(std::string::npos,
-            lLog.find("Failed in terminating Instance with pid " + std::to_string(lStubborn.mPid)));
+            lLog.find("Failed in terminating Instance with pid " + std::to_string(lStubborn.mChild.pid())));
   EXPECT_EQ(10u, qntest::countOf(lLog, "Sleep for 1 second..."));
   EXPECT_TRUE(lockedByOther(mPidFile));  // still running, still the instance
-  kill(lStubborn.mPid, SIGKILL);
-  EXPECT_EQ(128 + SIGKILL, qntest::waitExit(lStubborn.mPid));
+  kill(lStubborn.mChild.pid(), SIGKILL);
+  EXPECT_EQ(128 + SIGKILL, lStubborn.mChild.exit());
   Tool lNext = start("hold", "running");
-  EXPECT_EQ(pidBytes(lNext.mPid) + "extra", readFile(mPidFile));
-  kill(lNext.mPid, SIGTERM);
-  EXPECT_EQ(0, qntest::waitExit(lNext.mPid));
+  const pid_t lNextPid = lNext.mChild.pid();
+  kill(lNextPid, SIGTERM);
+  EXPECT_EQ(0, lNext.mChild.exit());
   EXPECT_NE(std::string::npos, readFile(lNext.mOut).find("stopped"));
+  // Written over without truncating, and neither deleted nor cleared at the exit.
+  EXPECT_EQ(pidBytes(lNextPid) + "extra", readFile(mPidFile));
 }
 
 // The lock is held (here by this test itself) but the file names no process: 2 bytes, or id 0.
@@ -208,7 +175,7 @@ TEST_F(InstanceTest, KillSignalsNobodyForAShortOrZeroId) {
     const int lHolder = open(mPidFile.c_str(), O_RDWR);
     OsLockFile(lHolder);
     Tool lKiller = start("kill");
-    EXPECT_EQ(1, qntest::waitExit(lKiller.mPid));
+    EXPECT_EQ(1, lKiller.mChild.exit());
     EXPECT_EQ("error: Failed to terminate running instance (code 488)\n", readFile(lKiller.mErr));
     EXPECT_EQ(std::string::npos, readFile(lKiller.mLog).find("Attempting to kill"));
     close(lHolder);
@@ -243,16 +210,12 @@ const std::vector<std::string> kStartUpSteps = {
 
 class DriverProcessTest : public ::testing::Test {
  protected:
-  pid_t start(const std::vector<std::string>& acrArguments) {
-    return qntest::spawnHelper(acrArguments, stdoutPath(), mDir.file("stderr"),
-                               {"QN_LOG_DIR=" + mDir.path()});
-  }
+  // The service (mService), once it has said it runs.
   pid_t startRunning(const std::vector<std::string>& acrArguments) {
-    const pid_t lPid = start(acrArguments);
-    if (!qntest::waitForText(stdoutPath(), "running\n")) {
-      ADD_FAILURE() << "the service never reached the running state; output:\n" << output();
-    }
-    return lPid;
+    mService = qntest::Child(
+        qntest::spawnHelper(acrArguments, stdoutPath(), mDir.file("stderr"), {"QN_LOG_DIR=" + mDir.path()}));
+    EXPECT_TRUE(qntest::waitForText(stdoutPath(), "running\n")) << "never running; output:\n" << output();
+    return mService.pid();
   }
 
   std::string stdoutPath() const { return mDir.file("stdout"); }
@@ -260,6 +223,7 @@ class DriverProcessTest : public ::testing::Test {
   std::string log() const { return qntest::readFile(mDir.file("driver_app.log")); }
 
   qntest::TempDir mDir;
+  qntest::Child mService;
 };
 
 // The whole run, the driver's own lines between the application's steps. The service's
@@ -269,7 +233,7 @@ class DriverSignalTest : public DriverProcessTest, public ::testing::WithParamIn
 TEST_P(DriverSignalTest, SignalShutsDownInOrder) {
   const pid_t lPid = startRunning({"run"});
   ASSERT_EQ(0, kill(lPid, GetParam()));
-  ASSERT_EQ(0, qntest::waitExit(lPid)) << output();
+  ASSERT_EQ(0, mService.exit()) << output();
   const std::string lLog = log();
   std::vector<std::string> lExpected;
   for (const auto& lStep : kStartUpSteps) lExpected.push_back("step " + lStep);
@@ -290,6 +254,11 @@ TEST_P(DriverSignalTest, SignalShutsDownInOrder) {
   EXPECT_NE(std::string::npos, output().find("exit request 1 self\n"))
       << "the handler must reach the registered object, which must still be registered";
   EXPECT_NE(std::string::npos, output().find("SystemMain returned\n"));
+  // After the log is closed an urgent line still reaches standard error, the only line there
+  // (a trace is dropped).
+  const std::string lErr = readFile(mDir.file("stderr"));
+  EXPECT_EQ(1u, qntest::countOf(lErr, "\n")) << lErr;
+  EXPECT_NE(std::string::npos, lErr.find(") urgent after the log was closed\n")) << lErr;
 }
 
 INSTANTIATE_TEST_SUITE_P(EachShutDownSignal, DriverSignalTest, ::testing::Values(SIGTERM, SIGINT, SIGHUP),
@@ -309,7 +278,7 @@ TEST_F(DriverProcessTest, TwoInterruptsShutDownOnceAndLaterSignalsAreIgnored) {
   ASSERT_EQ(0, kill(lPid, SIGINT));
   ASSERT_TRUE(qntest::waitForText(stdoutPath(), "SystemMain returned\n")) << output();
   for (const int lSignal : {SIGINT, SIGTERM, SIGHUP}) ASSERT_EQ(0, kill(lPid, lSignal));
-  EXPECT_EQ(0, qntest::waitExit(lPid)) << output();
+  EXPECT_EQ(0, mService.exit()) << output();
 
   EXPECT_NE(std::string::npos, output().find("exit request 2 self\n"));
   EXPECT_NE(std::string::npos, output().find("lingered\n"));
@@ -324,55 +293,25 @@ TEST_F(DriverProcessTest, TwoInterruptsShutDownOnceAndLaterSignalsAreIgnored) {
 // --- The signal dispatcher.
 using namespace std::chrono_literals;
 
-// What a handler saw; written by the handler, read by the test under gsSeenLock.
+// The thread the recording handler ran on, and how often the throwing one ran.
 std::mutex gsSeenLock;
 std::condition_variable gsSeenChanged;
-int gsCalls = 0;
-int gsLastSignal = 0;
-pid_t gsHandlerThread = 0;
+pid_t gsHandlerThread = 0;  // guarded by gsSeenLock
+std::atomic<int> gsThrows{0};
 
-void recordingHandler(int aSignal) {
+void recordingHandler(int) {
   std::lock_guard<std::mutex> lGuard(gsSeenLock);
-  ++gsCalls;
-  gsLastSignal = aSignal;
   gsHandlerThread = gettid();
   gsSeenChanged.notify_all();
 }
-
-bool waitForCalls(int aCalls) {
-  std::unique_lock<std::mutex> lGuard(gsSeenLock);
-  return gsSeenChanged.wait_for(lGuard, 10s, [aCalls] { return gsCalls >= aCalls; });
-}
-
-// The signal hits a thread of the application: the handler must run in a thread of its own, not
-// in the hit thread's signal context (where it could not take a lock that thread holds).
-TEST(SignalHandlerTest, SignalToAThreadOfTheApplicationRunsTheHandlerElsewhere) {
-  RegisterSignalHandler(SIGUSR2, recordingHandler);
-  std::atomic<pid_t> lTargetTid{0};
-  std::atomic<bool> lHandled{false};
-  std::thread lTarget([&] {
-    lTargetTid.store(gettid());
-    while (!lHandled.load()) std::this_thread::sleep_for(1ms);
-  });
-  while (lTargetTid.load() == 0) std::this_thread::sleep_for(1ms);
-  ASSERT_EQ(0, pthread_kill(lTarget.native_handle(), SIGUSR2));
-  const bool lCalled = waitForCalls(1);
-  lHandled.store(true);
-  lTarget.join();
-  ASSERT_TRUE(lCalled);
-  std::lock_guard<std::mutex> lGuard(gsSeenLock);
-  EXPECT_EQ(SIGUSR2, gsLastSignal);
-  EXPECT_NE(lTargetTid.load(), gsHandlerThread);
-  EXPECT_NE(gettid(), gsHandlerThread);
-}
-
-std::atomic<int> gsThrows{0};
 void throwingHandler(int) {
   ++gsThrows;
   throw QNCInvalidEx("handler failed on purpose", 6);
 }
 
-// A handler that throws leaves the dispatcher serving. Regression: a child forked after
+// A signal that hits a thread of the application runs its handler in a thread of its own, not
+// in the hit thread's signal context (where it could not take a lock that thread holds). A
+// handler that throws leaves the dispatcher serving. Regression: a child forked after
 // registration wrote its signal into the pipe it shares with the parent, so the parent's
 // dispatcher ran the handler, in the parent, for the child's signal. The pipe is served in
 // order: once the parent's SIGUSR2 has been handled, a byte the child had written and the
@@ -394,8 +333,21 @@ TEST(SignalHandlerTest, ThrowingHandlerOrAForkedChildsSignalLeavesTheDispatcherS
   EXPECT_TRUE(WIFSIGNALED(lStatus) && WTERMSIG(lStatus) == SIGUSR1) << "status " << lStatus;
 #endif
   ASSERT_EQ(0, kill(getpid(), SIGUSR1));
-  ASSERT_EQ(0, kill(getpid(), SIGUSR2));
-  ASSERT_TRUE(waitForCalls(1));
+  std::atomic<pid_t> lTargetTid{0};
+  std::atomic<bool> lHandled{false};
+  std::thread lTarget([&] {
+    lTargetTid.store(gettid());
+    while (!lHandled.load()) std::this_thread::sleep_for(1ms);
+  });
+  while (lTargetTid.load() == 0) std::this_thread::sleep_for(1ms);
+  ASSERT_EQ(0, pthread_kill(lTarget.native_handle(), SIGUSR2));
+  std::unique_lock<std::mutex> lGuard(gsSeenLock);
+  const bool lCalled = gsSeenChanged.wait_for(lGuard, 10s, [] { return gsHandlerThread != 0; });
+  lHandled.store(true);
+  lTarget.join();
+  ASSERT_TRUE(lCalled);
+  EXPECT_NE(lTargetTid.load(), gsHandlerThread);
+  EXPECT_NE(gettid(), gsHandlerThread);
   EXPECT_EQ(1, gsThrows.load()) << "the child's signal ran the handler in the parent, or ours did not run";
 }
 

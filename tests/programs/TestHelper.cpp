@@ -5,7 +5,7 @@
 //                                     print "running <pid>", wait for SIGTERM, release, exit 0
 //   hold-stubborn <pid-file> <log>    as hold, but SIGTERM is ignored: only SIGKILL ends it
 //   kill <pid-file> <log>             stop the running instance recorded in the file
-//   log-startup|log-exit <log>, log-crash <log> <signal>
+//   log-exit <log>, log-crash <log> <signal>
 //                                     one logger scenario that needs a process of its own
 //   run|linger [<requests>]
 //                                     a service on the start-up and shut-down driver (see Driver)
@@ -36,12 +36,6 @@ void say(const std::string& acrText) {
   (void)!write(STDOUT_FILENO, lLine.data(), lLine.size());
 }
 
-// Bounded, so a test that fails before creating the file leaves nothing behind for long.
-void waitForFile(const char* apPath) {
-  for (int lTry = 0; lTry < 3000 && access(apPath, F_OK) != 0; ++lTry)
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
-}
-
 int instance(const std::string& acrMode, int argc, char** argv) {
   // SIGTERM is blocked before any thread exists, so only sigwait() below ever takes it.
   sigset_t lTerm;
@@ -55,10 +49,11 @@ int instance(const std::string& acrMode, int argc, char** argv) {
   CreateLogger(QNCString(argv[3]));
   qntest::TableSystem lSystem(0, 0, 0);
   lSystem.usePidFile(argv[2]);
-  if (argc > 4) waitForFile(argv[4]);
+  // Bounded, so a test that fails before creating the go-file leaves nothing behind for long.
+  for (int lTry = 0; argc > 4 && lTry < 3000 && access(argv[4], F_OK) != 0; ++lTry)
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
   if (acrMode == "kill") {
     lSystem.killRunningInstance();
-    say("kill returned");
   } else {
     lSystem.markAsRunning();
     lSystem.getProcStatus(QNCString(argv[2]));
@@ -76,18 +71,7 @@ int instance(const std::string& acrMode, int argc, char** argv) {
 
 int logger(const std::string& acrMode, int argc, char** argv) {
   const char* lpLog = argv[2];
-  if (acrMode == "log-startup") {
-    QN_LOG_TRACE("early trace %d", 1);
-    QN_LOG_INFO("early info %d", 2);
-    QN_LOG_ERROR("early error %d", 3);
-    QN_LOG_WARNING("early warning %d", 4);
-    setLogCode(255 & ~static_cast<unsigned int>(QNLL_Info));  // as -d would, before the log opens
-    CreateLogger(lpLog);
-    QN_LOG_NOTICE("after open %d", 5);
-    destroyLogger();
-    QN_LOG_TRACE("after destroy %d", 6);
-    QN_LOG_ERROR("after destroy %d", 7);
-  } else if (acrMode == "log-exit") {
+  if (acrMode == "log-exit") {
     // exit(1) with lines buffered while another thread keeps logging.
     CreateLogger(lpLog);
     std::atomic<bool> lStarted{false};
@@ -187,6 +171,8 @@ int driver(const std::string& acrMode, int argc, char** argv) {
   setLogFilePath("driver_app.log");
   SystemMain(argc, argv);
   say("SystemMain returned");
+  QN_LOG_TRACE("dropped: the log is closed");
+  QN_LOG_ERROR("urgent after the log was closed");  // still reaches standard error
   if (acrMode == "linger") {
     // The tests send signals now; with their default effect any of them would end the process.
     std::this_thread::sleep_for(std::chrono::seconds(1));

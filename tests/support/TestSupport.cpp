@@ -89,12 +89,11 @@ int waitExit(pid_t aPid, std::chrono::milliseconds aTimeout) {
 }
 
 bool waitForText(const std::string& acrPath, const std::string& acrText, std::chrono::milliseconds aTimeout) {
-  const auto lDeadline = std::chrono::steady_clock::now() + aTimeout;
-  while (std::chrono::steady_clock::now() < lDeadline) {
+  for (const auto lDeadline = std::chrono::steady_clock::now() + aTimeout;;) {
     if (readFile(acrPath).find(acrText) != std::string::npos) return true;
+    if (std::chrono::steady_clock::now() > lDeadline) return false;
     std::this_thread::sleep_for(std::chrono::milliseconds(20));
   }
-  return readFile(acrPath).find(acrText) != std::string::npos;
 }
 
 size_t countOf(const std::string& acrHaystack, const std::string& acrText) {

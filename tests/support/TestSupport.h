@@ -5,6 +5,7 @@
 
 #include <chrono>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "Buffer.h"
@@ -39,6 +40,31 @@ pid_t spawn(const std::vector<std::string>& acrArgv, const std::vector<std::stri
 // Waits for the child and returns its exit status, or 128 + the signal that ended it, or -1 when
 // it did not end within the time-out (it is then killed with SIGKILL and reaped).
 int waitExit(pid_t aPid, std::chrono::milliseconds aTimeout = std::chrono::seconds(20));
+
+// A started process, killed (SIGKILL) and reaped when the object goes unless exit() has reaped
+// it: a test that fails half-way leaves nothing running behind it.
+class Child {
+ public:
+  explicit Child(pid_t aPid = -1) : mPid(aPid) {}
+  Child(Child&& arOther) noexcept : mPid(arOther.mPid) { arOther.mPid = -1; }
+  Child& operator=(Child&& arOther) noexcept {
+    std::swap(mPid, arOther.mPid);
+    return *this;
+  }
+  ~Child() {
+    if (mPid > 0) waitExit(mPid, std::chrono::milliseconds(0));
+  }
+  pid_t pid() const { return mPid; }
+  // waitExit's result; the process is reaped in any case.
+  int exit(std::chrono::milliseconds aTimeout = std::chrono::seconds(20)) {
+    const pid_t lPid = mPid;
+    mPid = -1;
+    return waitExit(lPid, aTimeout);
+  }
+
+ private:
+  pid_t mPid;
+};
 
 // Polls until the file contains the text, or the time-out passes.
 bool waitForText(const std::string& acrPath, const std::string& acrText,
