@@ -13,6 +13,8 @@
 #include <cstring>
 #include <functional>
 #include <future>
+#include <iterator>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -468,21 +470,25 @@ class CommandLineSystem : public qntest::TableSystem {
   void setCommandLineArgumentDesc() override {
     for (const QNSCommandLineArgumentDesc& lrDesc : kCommonOptions) mCommandLineArgumentDesc.append(lrDesc);
   }
-  // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest".
-  void process(const std::vector<std::string>& acrArguments) {
-    std::vector<std::string> lStorage{"sensortest"};
-    lStorage.insert(lStorage.end(), acrArguments.begin(), acrArguments.end());
+  // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest" and then the
+  // words of acrLine; returns the settings "DebugLevel HbTimeout Daemonize DBReopenInterval".
+  std::string process(const std::string& acrLine) {
+    std::istringstream lWords("sensortest " + acrLine);
+    std::vector<std::string> lArguments{std::istream_iterator<std::string>(lWords), {}};
     std::vector<char*> lArgv;
-    for (std::string& lrArgument : lStorage) lArgv.push_back(&lrArgument[0]);
+    for (std::string& lrArgument : lArguments) lArgv.push_back(&lrArgument[0]);
     lArgv.push_back(nullptr);
     preInit();
-    processCommandLine(static_cast<int>(lStorage.size()), lArgv.data());
-  }
-  int value(const char* apKey) {
-    QNCPointer<QNCMultiType> lValue;
-    getSetting(apKey, lValue);
-    return std::string(apKey) == "Daemonize" ? static_cast<signed char>(*lValue)
-                                             : static_cast<int>(static_cast<unsigned int>(*lValue));
+    processCommandLine(static_cast<int>(lArguments.size()), lArgv.data());
+    std::string lValues;
+    for (const std::string lKey : {"DebugLevel", "HbTimeout", "Daemonize", "DBReopenInterval"}) {
+      QNCPointer<QNCMultiType> lValue;
+      getSetting(lKey.c_str(), lValue);
+      lValues += (lValues.empty() ? "" : " ") +
+                 std::to_string(lKey == "Daemonize" ? static_cast<signed char>(*lValue)
+                                                    : static_cast<int>(static_cast<unsigned int>(*lValue)));
+    }
+    return lValues;
   }
   unsigned int settingCount() const { return mSettings.numberOfElements(); }
 };
@@ -502,30 +508,16 @@ class CommandLineTest : public qntest::LoggedTest {
 // daemonizing and the 15-minute interval. Numbers are read like atoi (a bad one is 0, a trailing
 // word ignored) and Daemonize is 1 only for exactly "true".
 TEST_F(CommandLineTest, GivenValuesReplaceOnlyTheirOwnDefaultsReadLikeAtoi) {
-  CommandLineSystem lSystem;
-  lSystem.process({"-d", "16", "-I", "30"});
-  EXPECT_EQ(16, lSystem.value("DebugLevel"));
-  EXPECT_EQ(41, lSystem.value("HbTimeout"));
-  EXPECT_EQ(1, lSystem.value("Daemonize"));
-  EXPECT_EQ(30, lSystem.value("DBReopenInterval"));
-  EXPECT_EQ(4u, lSystem.settingCount()) << "ConfigFile is written only for -c";
-  CommandLineSystem lBare;
-  lBare.process({});
-  EXPECT_EQ(249, lBare.value("DebugLevel"));
-  EXPECT_EQ(15, lBare.value("DBReopenInterval"));
-  const struct {
-    const char *mOption, *mValue, *mKey;
-    int mExpected;
-  } lCases[] = {
-      {"-D", "true", "Daemonize", 1},      {"-D", "TRUE", "Daemonize", 0},
-      {"-D", "1", "Daemonize", 0},         {"-I", "0", "DBReopenInterval", 0},
-      {"-I", "-5", "DBReopenInterval", 0}, {"-I", "7min", "DBReopenInterval", 7},
-      {"-d", "abc", "DebugLevel", 0},      {"-b", "45", "HbTimeout", 45},
+  const std::pair<const char*, const char*> lCases[] = {
+      {"-d 16 -I 30", "16 41 1 30"}, {"", "249 41 1 15"},       {"-D true", "249 41 1 15"},
+      {"-D TRUE", "249 41 0 15"},    {"-D 1", "249 41 0 15"},   {"-I 0", "249 41 1 0"},
+      {"-I -5", "249 41 1 0"},       {"-I 7min", "249 41 1 7"}, {"-d abc", "0 41 1 15"},
+      {"-b 45", "249 45 1 15"},
   };
   for (const auto& lrCase : lCases) {
-    CommandLineSystem lCaseSystem;
-    lCaseSystem.process({lrCase.mOption, lrCase.mValue});
-    EXPECT_EQ(lrCase.mExpected, lCaseSystem.value(lrCase.mKey)) << lrCase.mOption << " " << lrCase.mValue;
+    CommandLineSystem lSystem;
+    EXPECT_EQ(lrCase.second, lSystem.process(lrCase.first)) << lrCase.first;
+    EXPECT_EQ(4u, lSystem.settingCount()) << "ConfigFile is written only for -c";
   }
   expectInOrder(
       log(), {"Command line : '-d 16 -I 30'", "Processed the command line successfully : -d 16 -I 30",
