@@ -222,8 +222,17 @@ class SystemWaitTest : public ::testing::Test {
 // signal; the time-out and a failed emptiness test leave the conditional unlocked and usable; a
 // list that holds an element needs no wait.
 TEST_F(SystemWaitTest, WaitsEndOnASignalAndEveryWayOutReleasesTheConditional) {
+  const auto lReleased = [&] {
+    return qntest::returnsWithin(
+        [&] {
+          mSystem.conditional(0).lock();
+          mSystem.conditional(0).unlock();
+        },
+        10s);
+  };
   mSystem.signal(0);
   EXPECT_THROW(mSystem.timedWait(0, 30), QNCTimeOutEx);
+  ASSERT_TRUE(lReleased()) << "the time-out kept the conditional's lock";
   std::atomic<bool> lReturned{false};
   std::thread lWaiter([&] {
     EXPECT_NO_THROW(mSystem.wait(0));
@@ -241,12 +250,7 @@ TEST_F(SystemWaitTest, WaitsEndOnASignalAndEveryWayOutReleasesTheConditional) {
   EXPECT_TRUE(qntest::returnsWithin([&] { mSystem.waitOnEmptyList(0, 0); }, 10s, [&] { mSystem.signal(0); }));
   mQueue->mFailTest = true;
   EXPECT_THROW(mSystem.waitOnEmptyQueue(0, 0), QNCOsException);
-  EXPECT_TRUE(qntest::returnsWithin(
-      [&] {
-        mSystem.conditional(0).lock();
-        mSystem.conditional(0).unlock();
-      },
-      10s));
+  EXPECT_TRUE(lReleased()) << "the failed test kept the conditional's lock";
 }
 
 // Regression: a signal given without the conditional's lock between the waiter's emptiness test
