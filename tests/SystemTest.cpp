@@ -70,18 +70,22 @@ using qntest::ScriptedComponent;
 // that only listens for notifications would sleep the whole period instead of seeing the request
 // already given), or by destroying the started, never-joined component: the base destructor wakes
 // and joins the thread (a joinable std::thread destroyed would reach std::terminate).
+std::atomic<bool> gsWoken{false};
+
 TEST(ThreadComponentTest, ExitRequestEndsALongWaitMadeDuringOrBeforeItOrByTheDestructor) {
   for (const char* lWay : {"during", "before", "destructor"}) {
     const bool lBefore = lWay[0] == 'b', lByDestructor = lWay[0] == 'd';
     std::promise<void> lStarted, lGate;
     std::shared_future<void> lGateOpen = lGate.get_future().share();
-    std::atomic<bool> lWoken{false};
+    gsWoken = false;
     auto* lpComponent = new ScriptedComponent(
         [&](ScriptedComponent& arSelf) {
-          std::atomic<bool>& lrWoken = lWoken;  // the destructor frees this closure during the wait
+          // Copied first: once started, the destructor way may free this closure at any time.
+          const bool lWaitForGate = lBefore;
+          const std::shared_future<void> lGateToWaitFor = lGateOpen;
           lStarted.set_value();
-          if (lBefore) lGateOpen.wait();
-          lrWoken = arSelf.waitForExitRequest(kHour);
+          if (lWaitForGate) lGateToWaitFor.wait();
+          gsWoken = arSelf.waitForExitRequest(kHour);
         },
         "scripted", !lByDestructor);
     lpComponent->init();
@@ -90,7 +94,7 @@ TEST(ThreadComponentTest, ExitRequestEndsALongWaitMadeDuringOrBeforeItOrByTheDes
     lGate.set_value();
     if (!lByDestructor) lpComponent->waitForExit();  // an hour, unless the request ended the wait
     delete lpComponent;
-    EXPECT_TRUE(lWoken) << lWay;
+    EXPECT_TRUE(gsWoken) << lWay;
   }
 }
 
