@@ -9,12 +9,12 @@
 
 #include <algorithm>
 #include <atomic>
-#include <condition_variable>
 #include <cstdlib>
 #include <cstring>
 #include <functional>
 #include <future>
-#include <mutex>
+#include <iterator>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -66,24 +66,35 @@ constexpr unsigned int kHour = 3600u * 1000u;
 
 using qntest::ScriptedComponent;
 
-// Fault pinned for the request made first: a wait that only listens for notifications would
-// sleep the whole period instead of seeing the request already given.
-TEST(ThreadComponentTest, RequestExitWakesABodyInALongWaitEvenWhenMadeBeforeIt) {
-  for (const bool lRequestFirst : {false, true}) {
+// A body in a long wait ends at once on the exit request, made during the wait, before it (a wait
+// that only listens for notifications would sleep the whole period instead of seeing the request
+// already given), or by destroying the started, never-joined component: the base destructor wakes
+// and joins the thread (a joinable std::thread destroyed would reach std::terminate).
+std::atomic<bool> gsWoken{false};
+
+TEST(ThreadComponentTest, ExitRequestEndsALongWaitMadeDuringOrBeforeItOrByTheDestructor) {
+  for (const char* lWay : {"during", "before", "destructor"}) {
+    const bool lBefore = lWay[0] == 'b', lByDestructor = lWay[0] == 'd';
     std::promise<void> lStarted, lGate;
     std::shared_future<void> lGateOpen = lGate.get_future().share();
-    std::atomic<bool> lWoken{false};
-    ScriptedComponent lComponent([&](ScriptedComponent& arSelf) {
-      lStarted.set_value();
-      if (lRequestFirst) lGateOpen.wait();
-      lWoken = arSelf.waitForExitRequest(kHour);
-    });
-    lComponent.init();
+    gsWoken = false;
+    auto* lpComponent = new ScriptedComponent(
+        [&](ScriptedComponent& arSelf) {
+          // Copied first: once started, the destructor way may free this closure at any time.
+          const bool lWaitForGate = lBefore;
+          const std::shared_future<void> lGateToWaitFor = lGateOpen;
+          lStarted.set_value();
+          if (lWaitForGate) lGateToWaitFor.wait();
+          gsWoken = arSelf.waitForExitRequest(kHour);
+        },
+        "scripted", !lByDestructor);
+    lpComponent->init();
     lStarted.get_future().wait();
-    lComponent.requestExit();
+    if (!lByDestructor) lpComponent->requestExit();
     lGate.set_value();
-    lComponent.waitForExit();  // would block for an hour if the request did not end the wait
-    EXPECT_TRUE(lWoken) << lRequestFirst;
+    if (!lByDestructor) lpComponent->waitForExit();  // an hour, unless the request ended the wait
+    delete lpComponent;
+    EXPECT_TRUE(gsWoken) << lWay;
   }
 }
 
@@ -110,56 +121,24 @@ TEST(ThreadComponentTest, LifecycleStatesAndRepeatedCalls) {
   lComponent.requestExit();            // the thread has ended: no effect, no failure
 }
 
-// Destroying a started, never-joined component must not reach std::terminate (a joinable
-// std::thread destroyed) nor leave the thread behind: the base destructor wakes and joins it.
-std::atomic<bool> gsSleeperReturned{false};
-
-TEST(ThreadComponentTest, DestructorEndsAndJoinsARunningThread) {
-  std::promise<void> lAsleep;
-  auto* lpComponent = new ScriptedComponent(
-      [&](ScriptedComponent& arSelf) {
-        lAsleep.set_value();
-        while (!arSelf.waitForExitRequest(kHour)) {
-        }
-        gsSleeperReturned = true;
-      },
-      "scripted", false);
-  lpComponent->init();
-  lAsleep.get_future().wait();
-  delete lpComponent;
-  EXPECT_TRUE(gsSleeperReturned);
-}
-
-// Tasks submitted before init() wait for the workers; every task runs exactly once; two tasks
-// that wait for each other both finish, so the workers run at the same time.
-TEST(ThreadPoolTest, EveryTaskRunsExactlyOnceOnWorkersRunningTogether) {
+// Tasks submitted before init() wait for the workers; every task runs exactly once on workers
+// that take from one queue at the same time.
+TEST(ThreadPoolTest, EveryTaskRunsExactlyOnce) {
   std::vector<std::atomic<int>> lRuns(2000);
-  std::mutex lLock;
-  std::condition_variable lArrived;
-  int lCount = 0;
-  std::atomic<int> lMet{0};
   QNCThreadPool lPool("counters", 3);
   for (unsigned int lIndex = 0; lIndex < lRuns.size(); ++lIndex) {
     if (lIndex == 2) lPool.init();
     lPool.submit([&lRuns, lIndex] { ++lRuns[lIndex]; });
   }
-  for (int lIndex = 0; lIndex < 2; ++lIndex) {
-    lPool.submit([&] {
-      std::unique_lock<std::mutex> lGuard(lLock);
-      ++lCount;
-      lArrived.notify_all();
-      if (lArrived.wait_for(lGuard, std::chrono::seconds(30), [&] { return lCount == 2; })) ++lMet;
-    });
-  }
   lPool.finish();
   lPool.waitForThreads();
   for (unsigned int lIndex = 0; lIndex < lRuns.size(); ++lIndex) ASSERT_EQ(1, lRuns[lIndex].load()) << lIndex;
-  EXPECT_EQ(2, lMet);
 }
 
-// finish() while every worker is busy, called directly or by the destructor of a pool that was
-// never finished: what was queued before still runs, a later submission is refused, and the
-// workers end (destroying joinable threads would terminate the process).
+// finish() while every worker is busy (both inside a task at once: the workers run together),
+// called directly or by the destructor of a pool that was never finished: what was queued before
+// still runs, a later submission is refused, and the workers end (destroying joinable threads
+// would terminate the process).
 TEST(ThreadPoolTest, FinishWhileTasksRunDrainsTheQueueAndRefusesLaterTasks) {
   for (const bool lByDestructor : {false, true}) {
     std::promise<void> lGate;
@@ -176,7 +155,7 @@ TEST(ThreadPoolTest, FinishWhileTasksRunDrainsTheQueueAndRefusesLaterTasks) {
         });
       }
       for (int lIndex = 0; lIndex < 5; ++lIndex) lPool.submit([&] { ++lDone; });
-      while (lBusy.load() < 2) std::this_thread::yield();  // both workers are inside a task
+      EXPECT_TRUE(qntest::eventually([&] { return lBusy.load() == 2; })) << "the workers do not run together";
       if (!lByDestructor) {
         lPool.finish();
         EXPECT_EQ("ThreadPool 'drain' is finished: task refused",
@@ -495,21 +474,25 @@ class CommandLineSystem : public qntest::TableSystem {
   void setCommandLineArgumentDesc() override {
     for (const QNSCommandLineArgumentDesc& lrDesc : kCommonOptions) mCommandLineArgumentDesc.append(lrDesc);
   }
-  // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest".
-  void process(const std::vector<std::string>& acrArguments) {
-    std::vector<std::string> lStorage{"sensortest"};
-    lStorage.insert(lStorage.end(), acrArguments.begin(), acrArguments.end());
+  // preInit and processCommandLine as SysInit runs them, with argv[0] = "sensortest" and then the
+  // words of acrLine; returns the settings "DebugLevel HbTimeout Daemonize DBReopenInterval".
+  std::string process(const std::string& acrLine) {
+    std::istringstream lWords("sensortest " + acrLine);
+    std::vector<std::string> lArguments{std::istream_iterator<std::string>(lWords), {}};
     std::vector<char*> lArgv;
-    for (std::string& lrArgument : lStorage) lArgv.push_back(&lrArgument[0]);
+    for (std::string& lrArgument : lArguments) lArgv.push_back(&lrArgument[0]);
     lArgv.push_back(nullptr);
     preInit();
-    processCommandLine(static_cast<int>(lStorage.size()), lArgv.data());
-  }
-  int value(const char* apKey) {
-    QNCPointer<QNCMultiType> lValue;
-    getSetting(apKey, lValue);
-    return std::string(apKey) == "Daemonize" ? static_cast<signed char>(*lValue)
-                                             : static_cast<int>(static_cast<unsigned int>(*lValue));
+    processCommandLine(static_cast<int>(lArguments.size()), lArgv.data());
+    std::string lValues;
+    for (const std::string lKey : {"DebugLevel", "HbTimeout", "Daemonize", "DBReopenInterval"}) {
+      QNCPointer<QNCMultiType> lValue;
+      getSetting(lKey.c_str(), lValue);
+      lValues += (lValues.empty() ? "" : " ") +
+                 std::to_string(lKey == "Daemonize" ? static_cast<signed char>(*lValue)
+                                                    : static_cast<int>(static_cast<unsigned int>(*lValue)));
+    }
+    return lValues;
   }
   unsigned int settingCount() const { return mSettings.numberOfElements(); }
 };
@@ -529,30 +512,16 @@ class CommandLineTest : public qntest::LoggedTest {
 // daemonizing and the 15-minute interval. Numbers are read like atoi (a bad one is 0, a trailing
 // word ignored) and Daemonize is 1 only for exactly "true".
 TEST_F(CommandLineTest, GivenValuesReplaceOnlyTheirOwnDefaultsReadLikeAtoi) {
-  CommandLineSystem lSystem;
-  lSystem.process({"-d", "16", "-I", "30"});
-  EXPECT_EQ(16, lSystem.value("DebugLevel"));
-  EXPECT_EQ(41, lSystem.value("HbTimeout"));
-  EXPECT_EQ(1, lSystem.value("Daemonize"));
-  EXPECT_EQ(30, lSystem.value("DBReopenInterval"));
-  EXPECT_EQ(4u, lSystem.settingCount()) << "ConfigFile is written only for -c";
-  CommandLineSystem lBare;
-  lBare.process({});
-  EXPECT_EQ(249, lBare.value("DebugLevel"));
-  EXPECT_EQ(15, lBare.value("DBReopenInterval"));
-  const struct {
-    const char *mOption, *mValue, *mKey;
-    int mExpected;
-  } lCases[] = {
-      {"-D", "true", "Daemonize", 1},      {"-D", "TRUE", "Daemonize", 0},
-      {"-D", "1", "Daemonize", 0},         {"-I", "0", "DBReopenInterval", 0},
-      {"-I", "-5", "DBReopenInterval", 0}, {"-I", "7min", "DBReopenInterval", 7},
-      {"-d", "abc", "DebugLevel", 0},      {"-b", "45", "HbTimeout", 45},
+  const std::pair<const char*, const char*> lCases[] = {
+      {"-d 16 -I 30", "16 41 1 30"}, {"", "249 41 1 15"},       {"-D true", "249 41 1 15"},
+      {"-D TRUE", "249 41 0 15"},    {"-D 1", "249 41 0 15"},   {"-I 0", "249 41 1 0"},
+      {"-I -5", "249 41 1 0"},       {"-I 7min", "249 41 1 7"}, {"-d abc", "0 41 1 15"},
+      {"-b 45", "249 45 1 15"},
   };
   for (const auto& lrCase : lCases) {
-    CommandLineSystem lCaseSystem;
-    lCaseSystem.process({lrCase.mOption, lrCase.mValue});
-    EXPECT_EQ(lrCase.mExpected, lCaseSystem.value(lrCase.mKey)) << lrCase.mOption << " " << lrCase.mValue;
+    CommandLineSystem lSystem;
+    EXPECT_EQ(lrCase.second, lSystem.process(lrCase.first)) << lrCase.first;
+    EXPECT_EQ(4u, lSystem.settingCount()) << "ConfigFile is written only for -c";
   }
   expectInOrder(
       log(), {"Command line : '-d 16 -I 30'", "Processed the command line successfully : -d 16 -I 30",
