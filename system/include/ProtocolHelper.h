@@ -54,13 +54,25 @@ class QNCProtocolHelper {
                      bool acWithoutSize);
 
  private:
+  // Each operation looks at the trace level once and runs these with their trace lines (acTrace)
+  // or without any, so a masked-off helper pays no test per line.
+  template <bool acTrace>
+  void _read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer, unsigned int acSize);
+  template <bool acTrace>
+  void _write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer, bool acWithoutSize);
+  template <bool acTrace>
   void __readSize(QNCPointer<QNCReader>& arReader, unsigned int& arSize);
+  template <bool acTrace>
   void __readActual(QNCPointer<QNCReader>& arReader, unsigned int& arCount, QNCPointer<QNCBuffer>& arBuffer);
+  template <bool acTrace>
   void __read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
+  template <bool acTrace>
   void __writeSize(QNCPointer<QNCWriter>& arWriter, unsigned int aSize);
+  template <bool acTrace>
   void __writeActual(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer);
   // Gathers acTotal bytes into arTarget (capacity at least acTotal) through reads offered exactly
   // the missing length.
+  template <bool acTrace>
   void __gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arTarget, unsigned int acTotal);
 
   const unsigned int mRetrySleepTime;
