@@ -15,9 +15,10 @@ namespace {
 constexpr unsigned int kMaxAttempts = 301;
 constexpr unsigned int kReadFailedCode = 328;
 
+// Object and bytes in one allocation: a message buffer is made per message and dropped by the
+// caller.
 QNCPointer<QNCBuffer> newBuffer(unsigned int acLength) {
-  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(acLength, 0), QNPST_Individual,
-                               QNPAT_New);
+  return QNCPointer<QNCBuffer>(QNCAllocatedBuffer::createJoint(acLength), QNPST_Individual, QNPAT_New);
 }
 
 // This thread's 4-byte buffer for size prefixes, so that framing a message allocates nothing for
