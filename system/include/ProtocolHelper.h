@@ -26,7 +26,10 @@
 // Writing a message: one writer call for the prefix (unless acWithoutSize), one for the body; the
 // counts are traced, not checked.
 // Prefixes are read and written through a 4-byte buffer that each thread keeps and reuses while
-// no reader or writer holds on to it, so a framed message allocates only its body's buffer.
+// no reader or writer holds on to it, so a framed message allocates only its body's buffer (its
+// object and bytes in one block, and its counter).
+// Trace: read() and write() look at the trace level once; with trace on every trace line of the
+// call is written as the mask decides at that moment, with trace off the call tests no line.
 //
 // Threads: no lock, and no shared state that changes after construction (the prefix buffers are
 // per thread), so any number of threads may use one helper. Threads sharing one reader or writer keep whole
