@@ -17,17 +17,20 @@ unsigned char* allocateStorage(unsigned int aCapacity) {
 QNCBuffer::QNCBuffer(unsigned int acUseLength, unsigned int acMaxLength)
     : mStorage(nullptr),
       mLength(acUseLength),
-      mCapacity(acMaxLength < acUseLength ? acUseLength : acMaxLength) {
+      mCapacity(acMaxLength < acUseLength ? acUseLength : acMaxLength),
+      mOwnsStorage(true) {
   mStorage = allocateStorage(mCapacity);
 }
 
 QNCBuffer::QNCBuffer(const unsigned char* apBytes, unsigned int aLength)
-    : mStorage(nullptr), mLength(aLength), mCapacity(aLength) {
+    : mStorage(nullptr), mLength(aLength), mCapacity(aLength), mOwnsStorage(true) {
   mStorage = allocateStorage(mCapacity);
   if (aLength != 0) memcpy(mStorage, apBytes, aLength);
 }
 
-QNCBuffer::~QNCBuffer() { delete[] mStorage; }
+QNCBuffer::~QNCBuffer() {
+  if (mOwnsStorage) delete[] mStorage;
+}
 
 unsigned char QNCBuffer::byte(unsigned int aIndex) const {
   if (aIndex >= mLength) throw QNCInvalidEx("Buffer index beyond the used length", 6);

@@ -56,6 +56,16 @@ QNCBufferManager::~QNCBufferManager() {
     if (acTrace) QN_POOL_LOG(QNLL_Trace, "-T-", acpFunction, __VA_ARGS__); \
   } while (0)
 
+namespace {
+// Element aIndex of one of the bucket vectors, for an index the caller has already bounded (the
+// bucket scan or an assertion): the vectors all hold one element per bucket and never change
+// after construction, so a second check per access would only cost time.
+template <class T>
+[[gnu::always_inline]] inline T& bucketElement(QNCVector<T>& arVector, unsigned int aIndex) {
+  return (&arVector[0])[aIndex];
+}
+}  // namespace
+
 template <bool acTrace>
 [[gnu::always_inline]] inline void QNCBufferManager::_determineBucketNo(unsigned int aLength,
                                                                         unsigned int& arBucketNo) const {
@@ -86,14 +96,16 @@ template <bool acTrace>
     _determineBucketNo<acTrace>(aLength, lIndex);
     QN_ASSERT(lIndex < this->mBufferQueues.numberOfElements());
     // Made non-null at construction and never changed.
-    QNCMutex& lMutex = *mBufferQueueMutexes[lIndex].get();
-    QNCBufferQueue& lQueue = *mBufferQueues[lIndex].get();
+    QNCMutex& lMutex = *bucketElement(mBufferQueueMutexes, lIndex).get();
+    QNCBufferQueue& lQueue = *bucketElement(mBufferQueues, lIndex).get();
+    // Read before the lock (the lengths never change), so that its assertion repeats the one
+    // above and costs nothing; the trace line keeps its place after the lock.
+    const unsigned int lBufferSize = _bucketBufferLength(lIndex);
 
     QN_POOL_TRACE("get", "Locking bucket # %u", lIndex);
     lMutex.lock();
     lHeldMutex = &lMutex;
     QN_POOL_TRACE("get", "Getting buffer length of bucket # %u", lIndex);
-    const unsigned int lBufferSize = _bucketBufferLength(lIndex);
     QN_ASSERT(0 != lBufferSize);
     QNCPointer<QNCBuffer> lBuffer;
     if (lQueue.isEmpty()) {
@@ -149,8 +161,8 @@ template <bool acTrace>
     return;
   }
   // Made non-null at construction and never changed.
-  QNCMutex& lMutex = *mBufferQueueMutexes[lIndex].get();
-  QNCBufferQueue& lQueue = *mBufferQueues[lIndex].get();
+  QNCMutex& lMutex = *bucketElement(mBufferQueueMutexes, lIndex).get();
+  QNCBufferQueue& lQueue = *bucketElement(mBufferQueues, lIndex).get();
   // The queue's own reference, taken before the lock so that its counter update does not
   // lengthen the locked section; should the enqueue fail it is dropped after the unlock.
   QNCPointer<QNCBuffer> lQueued(arBuffer);

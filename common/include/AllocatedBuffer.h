@@ -9,6 +9,8 @@
 //
 // Threads: as QNCBuffer.
 
+#include <new>
+
 #include "Assert.h"
 #include "Buffer.h"
 
@@ -23,5 +25,23 @@ class QNCAllocatedBuffer : public QNCBuffer {
     QN_ASSERT(acMaxLength == 0 || acUseLength <= acMaxLength);
   }
 
+  // A buffer of used length and capacity acUseLength (not 0: asserted) whose storage lies in the
+  // object's own allocation: one allocation instead of two, for buffers made and dropped per
+  // message. Null when memory is short; hand it at once to a QNCPointer as above, which then
+  // throws QNCNoMemoryEx "Out of Memory" (2).
+  static QNCAllocatedBuffer* createJoint(unsigned int acUseLength) noexcept {
+    void* const lpBlock = ::operator new(sizeof(QNCAllocatedBuffer) + acUseLength, std::nothrow);
+    if (lpBlock == nullptr) return nullptr;
+    return new (lpBlock) QNCAllocatedBuffer(
+        QNSJoint(), static_cast<unsigned char*>(lpBlock) + sizeof(QNCAllocatedBuffer), acUseLength);
+  }
+
   ~QNCAllocatedBuffer() override {}
+
+ private:
+  struct QNSJoint {};  // tells this constructor from the public one, whatever literals a caller passes
+  QNCAllocatedBuffer(QNSJoint, unsigned char* apStorage, unsigned int acUseLength) noexcept
+      : QNCBuffer(apStorage, acUseLength, acUseLength) {
+    QN_ASSERT(acUseLength != 0);
+  }
 };

@@ -18,6 +18,8 @@
 // Threads: one thread at a time. A buffer handed between threads through a queue or the pool is
 // published by that structure's lock.
 
+#include <new>
+
 class QNCBuffer {
  public:
   // Owns new storage of acMaxLength bytes, or acUseLength bytes when acMaxLength is 0; the used
@@ -35,6 +37,12 @@ class QNCBuffer {
   QNCBuffer(const QNCBuffer&) = delete;
   QNCBuffer& operator=(const QNCBuffer&) = delete;
   virtual ~QNCBuffer();
+
+  // A buffer may have been allocated with its storage behind it (QNCAllocatedBuffer::
+  // createJoint), so it is always released whole, whatever size its class has. The second form
+  // releases a buffer made with new (std::nothrow) whose constructor threw.
+  static void operator delete(void* apObject) noexcept { ::operator delete(apObject); }
+  static void operator delete(void* apObject, const std::nothrow_t&) noexcept { ::operator delete(apObject); }
 
   // The byte at aIndex. Throws QNCInvalidEx "Buffer index beyond the used length" (6) when
   // aIndex >= getLength().
@@ -56,8 +64,15 @@ class QNCBuffer {
   // The number of bytes the storage holds; fixed for the buffer's life.
   unsigned int getCapacity() const { return mCapacity; }
 
+ protected:
+  // Over aCapacity bytes of storage at apStorage that the subclass allocated together with the
+  // object: they are neither allocated nor freed here. acUseLength <= aCapacity.
+  QNCBuffer(unsigned char* apStorage, unsigned int acUseLength, unsigned int aCapacity) noexcept
+      : mStorage(apStorage), mLength(acUseLength), mCapacity(aCapacity), mOwnsStorage(false) {}
+
  private:
-  unsigned char* mStorage;  // new[] of mCapacity bytes, owned
+  unsigned char* mStorage;  // mCapacity bytes: new[] and owned, or inside the object's allocation
   unsigned int mLength;
   unsigned int mCapacity;
+  bool mOwnsStorage;  // mStorage came from new[]
 };

@@ -15,6 +15,3 @@ QNCMutex::~QNCMutex() {
   }
   QN_LEFT();
 }
-
-void QNCMutex::lock() { OsLockMutex(mMutex); }
-void QNCMutex::unlock() { OsUnlockMutex(mMutex); }

@@ -16,15 +16,7 @@ void OsInitMutex(pthread_mutex_t& arMutex) {
   if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_mutex_init");
 }
 
-void OsLockMutex(pthread_mutex_t& arMutex) {
-  const int lResult = pthread_mutex_lock(&arMutex);
-  if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_mutex_lock");
-}
-
-void OsUnlockMutex(pthread_mutex_t& arMutex) {
-  const int lResult = pthread_mutex_unlock(&arMutex);
-  if (lResult != 0) OsThrowError<QNCOsException>(lResult, "pthread_mutex_unlock");
-}
+void OsThrowMutexError(int aResult, const char* apCall) { OsThrowError<QNCOsException>(aResult, apCall); }
 
 void OsDestroyMutex(pthread_mutex_t& arMutex) {
   const int lResult = pthread_mutex_destroy(&arMutex);

@@ -88,7 +88,7 @@ class QNCBufferManager {
 
   unsigned int _bucketBufferLength(unsigned int acIndex) const {
     QN_ASSERT(acIndex < this->mBufferQueues.numberOfElements());
-    return mBufferLengths[acIndex];
+    return (&mBufferLengths[0])[acIndex];  // bounded by the assertion: the vectors match
   }
 
   // Element i of each vector describes bucket i; none of them changes after construction.

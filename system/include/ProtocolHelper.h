@@ -26,7 +26,10 @@
 // Writing a message: one writer call for the prefix (unless acWithoutSize), one for the body; the
 // counts are traced, not checked.
 // Prefixes are read and written through a 4-byte buffer that each thread keeps and reuses while
-// no reader or writer holds on to it, so a framed message allocates only its body's buffer.
+// no reader or writer holds on to it, so a framed message allocates only its body's buffer (its
+// object and bytes in one block, and its counter).
+// Trace: read() and write() look at the trace level once; with trace on every trace line of the
+// call is written as the mask decides at that moment, with trace off the call tests no line.
 //
 // Threads: no lock, and no shared state that changes after construction (the prefix buffers are
 // per thread), so any number of threads may use one helper. Threads sharing one reader or writer keep whole
@@ -54,13 +57,25 @@ class QNCProtocolHelper {
                      bool acWithoutSize);
 
  private:
+  // Each operation looks at the trace level once and runs these with their trace lines (acTrace)
+  // or without any, so a masked-off helper pays no test per line.
+  template <bool acTrace>
+  void _read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer, unsigned int acSize);
+  template <bool acTrace>
+  void _write(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer, bool acWithoutSize);
+  template <bool acTrace>
   void __readSize(QNCPointer<QNCReader>& arReader, unsigned int& arSize);
+  template <bool acTrace>
   void __readActual(QNCPointer<QNCReader>& arReader, unsigned int& arCount, QNCPointer<QNCBuffer>& arBuffer);
+  template <bool acTrace>
   void __read(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arBuffer, unsigned int& arCount);
+  template <bool acTrace>
   void __writeSize(QNCPointer<QNCWriter>& arWriter, unsigned int aSize);
+  template <bool acTrace>
   void __writeActual(QNCPointer<QNCWriter>& arWriter, const QNCPointer<QNCBuffer>& acrBuffer);
   // Gathers acTotal bytes into arTarget (capacity at least acTotal) through reads offered exactly
   // the missing length.
+  template <bool acTrace>
   void __gather(QNCPointer<QNCReader>& arReader, QNCPointer<QNCBuffer>& arTarget, unsigned int acTotal);
 
   const unsigned int mRetrySleepTime;

@@ -33,10 +33,20 @@ enum QNEFileLockStatus : unsigned char {
 
 // Initialises a mutex. Throws QNCOsException when the system has no resources for it.
 void OsInitMutex(pthread_mutex_t& arMutex);
+// Throws the QNCOsException for a mutex call apCall that returned the error number aResult.
+[[noreturn, gnu::cold]] void OsThrowMutexError(int aResult, const char* apCall);
 // Blocks until the calling thread holds the mutex. Throws QNCOsException on a broken mutex.
-void OsLockMutex(pthread_mutex_t& arMutex);
+// Inline, as is OsUnlockMutex: every lock of the system passes here, and an uncontended lock
+// should cost the system call's user-space part and nothing more.
+inline void OsLockMutex(pthread_mutex_t& arMutex) {
+  const int lResult = pthread_mutex_lock(&arMutex);
+  if (__builtin_expect(lResult != 0, 0)) OsThrowMutexError(lResult, "pthread_mutex_lock");
+}
 // Releases a mutex the calling thread holds. Throws QNCOsException on a broken mutex.
-void OsUnlockMutex(pthread_mutex_t& arMutex);
+inline void OsUnlockMutex(pthread_mutex_t& arMutex) {
+  const int lResult = pthread_mutex_unlock(&arMutex);
+  if (__builtin_expect(lResult != 0, 0)) OsThrowMutexError(lResult, "pthread_mutex_unlock");
+}
 // Destroys a mutex. Throws QNCOsException when the system refuses, for example with EBUSY for a
 // mutex that is still locked; the mutex is then left as it was.
 void OsDestroyMutex(pthread_mutex_t& arMutex);
