@@ -69,7 +69,7 @@ class PointerTest : public ::testing::Test {
     QNSTracked::sOnDestroy = nullptr;
   }
   static QNCPointer<QNSTracked> make(int aId) {
-    return QNCPointer<QNSTracked>(new (std::nothrow) QNSTracked(aId), QNPST_Individual, QNPAT_New);
+    return QNCPointer<QNSTracked>(new (std::nothrow) QNSTracked(aId));
   }
   static std::vector<int>& destroyed() { return QNSTracked::sDestroyed; }
 };
@@ -112,9 +112,9 @@ TEST_F(PointerTest, OnlyTheLastReferenceDestroysTheObject) {
 // head, and the old head owned the source, so the fields came from freed memory.
 TEST_F(PointerTest, AssigningFromAMemberOfTheReleasedObject) {
   {
-    QNCPointer<QNSNode> lHead(new (std::nothrow) QNSNode(1), QNPST_Individual, QNPAT_New);
-    lHead->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(2), QNPST_Individual, QNPAT_New);
-    lHead->mNext->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(3), QNPST_Individual, QNPAT_New);
+    QNCPointer<QNSNode> lHead(new (std::nothrow) QNSNode(1));
+    lHead->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(2));
+    lHead->mNext->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(3));
     lHead = lHead->mNext;
     EXPECT_EQ(2, lHead->mTracked.mId);
     lHead = std::move(lHead->mNext);
@@ -132,8 +132,7 @@ TEST_F(PointerTest, ArraysAndDerivedObjectsAreDestroyedWhole) {
   QNCPointer<QNSTracked>(lpArray, QNPST_Array, QNPAT_New).reset();
   EXPECT_EQ((std::vector<int>{3, 2, 1}), destroyed());
   destroyed().clear();
-  auto* lpDerived =
-      new QNCPointer<QNSDerivedTracked>(new (std::nothrow) QNSDerivedTracked, QNPST_Individual, QNPAT_New);
+  auto* lpDerived = new QNCPointer<QNSDerivedTracked>(new (std::nothrow) QNSDerivedTracked);
   QNCPointer<QNSTracked> lBase(*lpDerived);
   delete lpDerived;
   EXPECT_TRUE(destroyed().empty());
