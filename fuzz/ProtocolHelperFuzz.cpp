@@ -142,8 +142,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   ScriptedReader* lpScript = new (std::nothrow) ScriptedReader(apData + lSkip, aSize - lSkip);
   QNCPointer<QNCReader> lReader(lpScript);
   QNCProtocolHelper lHelper(0, lMaximum);
-  for (unsigned int lMessages = 0; lMessages < kMaxMessagesPerInput; ++lMessages) {
+  for (unsigned int lMessages = 0; lMessages < kMaxMessagesPerInput; ++lMessages)
     if (!readOne(lHelper, lReader, *lpScript, lFixedSize, lMaximum)) break;
-  }
   return 0;
 }
