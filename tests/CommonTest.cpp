@@ -37,8 +37,8 @@ using qntest::thrown;
 // An object that records its destruction; an optional hook runs inside the destructor, so a
 // test can look at the world at the moment the object dies.
 struct QNSTracked {
-  static std::vector<int> sDestroyed;
-  static std::function<void(int)> sOnDestroy;
+  inline static std::vector<int> sDestroyed;
+  inline static std::function<void(int)> sOnDestroy;
   explicit QNSTracked(int aId = 0) : mId(aId) {}
   virtual ~QNSTracked() {
     sDestroyed.push_back(mId);
@@ -46,8 +46,6 @@ struct QNSTracked {
   }
   int mId;
 };
-std::vector<int> QNSTracked::sDestroyed;
-std::function<void(int)> QNSTracked::sOnDestroy;
 
 // Its destructor records the negated id before the base part records the id itself.
 struct QNSDerivedTracked : QNSTracked {
@@ -161,7 +159,7 @@ TEST_F(PointerTest, CopiesReleasedOnManyThreadsDestroyTheObjectOnce) {
 // An element whose copies fail with std::bad_alloc on request, as an allocation inside a copy
 // would; the containers must turn that into their own exception and stay unchanged.
 struct QNSFragile {
-  static bool sFailCopies;
+  inline static bool sFailCopies = false;
   explicit QNSFragile(int aValue) : mValue(aValue) {}
   QNSFragile(const QNSFragile& acrOther) : mValue(acrOther.mValue) {
     if (sFailCopies) throw std::bad_alloc();
@@ -175,7 +173,6 @@ struct QNSFragile {
   QNSFragile& operator=(QNSFragile&&) noexcept = default;
   int mValue;
 };
-bool QNSFragile::sFailCopies = false;
 
 // The same, default-constructible as well: a queue recycles its nodes for it, and a copy into a
 // recycled node must fail like a fresh allocation.
@@ -344,7 +341,6 @@ class InterruptingSignal {
     struct sigaction lAction = {};
     lAction.sa_handler = countSignal;
     sigemptyset(&lAction.sa_mask);
-    lAction.sa_flags = 0;
     sigaction(SIGUSR1, &lAction, &mPrevious);
   }
   ~InterruptingSignal() { sigaction(SIGUSR1, &mPrevious, nullptr); }
