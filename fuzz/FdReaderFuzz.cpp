@@ -21,7 +21,6 @@
 #include "Buffer.h"
 #include "FdReader.h"
 #include "FuzzSupport.h"
-#include "Logger.h"
 #include "ProtocolHelper.h"
 #include "QNException.h"
 

@@ -29,7 +29,6 @@
 
 #include "AllocatedBuffer.h"
 #include "FuzzSupport.h"
-#include "Logger.h"
 #include "ProtocolHelper.h"
 #include "QNException.h"
 #include "Reader.h"

@@ -16,13 +16,11 @@
 #include "Conditional.h"
 #include "ProcessInstanceManager.h"
 #include "QNException.h"
-#include "Reader.h"
 #include "SynchList.h"
 #include "SynchQueue.h"
 #include "System.h"
 #include "ThreadComponent.h"
 #include "ThreadPool.h"
-#include "Writer.h"
 
 namespace qntest {
 
