@@ -22,7 +22,6 @@
 
 #include "CommandLineParser.h"
 #include "FuzzSupport.h"
-#include "Logger.h"
 #include "QNException.h"
 
 namespace {

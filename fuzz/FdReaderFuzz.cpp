@@ -21,7 +21,6 @@
 #include "Buffer.h"
 #include "FdReader.h"
 #include "FuzzSupport.h"
-#include "Logger.h"
 #include "ProtocolHelper.h"
 #include "QNException.h"
 
@@ -45,7 +44,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   QN_FUZZ_CHECK(close(lPipe[1]) == 0);
 
   QNCFdReader* lpFdReader = new (std::nothrow) QNCFdReader(lPipe[0], true, lStagingSize);
-  QNCPointer<QNCReader> lReader(lpFdReader, QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCReader> lReader(lpFdReader);
   QNCProtocolHelper lHelper(0, kMaximum);
   size_t lAt = 0;  // the start of the next message in the stream
   for (;;) {

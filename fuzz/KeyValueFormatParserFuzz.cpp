@@ -24,7 +24,6 @@
 
 #include "FuzzSupport.h"
 #include "KeyValueFormatParser.h"
-#include "Logger.h"
 #include "QNException.h"
 
 namespace {

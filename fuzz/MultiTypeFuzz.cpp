@@ -15,7 +15,6 @@
 #include <string>
 
 #include "FuzzSupport.h"
-#include "Logger.h"
 #include "MultiType.h"
 #include "QNException.h"
 

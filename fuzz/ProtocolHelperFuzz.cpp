@@ -29,7 +29,6 @@
 
 #include "AllocatedBuffer.h"
 #include "FuzzSupport.h"
-#include "Logger.h"
 #include "ProtocolHelper.h"
 #include "QNException.h"
 #include "Reader.h"
@@ -41,8 +40,7 @@ constexpr unsigned int kSmallMaximum = 64;
 constexpr unsigned int kMaxMessagesPerInput = 64;
 
 QNCPointer<QNCBuffer> newBuffer(unsigned int aLength) {
-  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, 0), QNPST_Individual,
-                               QNPAT_New);
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aLength, 0));
 }
 
 class ScriptedReader : public QNCReader {
@@ -141,10 +139,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* apData, size_t aSize) {
   const unsigned int lMaximum = (lOptions & 2) != 0 ? kSmallMaximum : kLargeMaximum;
 
   ScriptedReader* lpScript = new (std::nothrow) ScriptedReader(apData + lSkip, aSize - lSkip);
-  QNCPointer<QNCReader> lReader(lpScript, QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCReader> lReader(lpScript);
   QNCProtocolHelper lHelper(0, lMaximum);
-  for (unsigned int lMessages = 0; lMessages < kMaxMessagesPerInput; ++lMessages) {
+  for (unsigned int lMessages = 0; lMessages < kMaxMessagesPerInput; ++lMessages)
     if (!readOne(lHelper, lReader, *lpScript, lFixedSize, lMaximum)) break;
-  }
   return 0;
 }

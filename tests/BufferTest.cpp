@@ -33,8 +33,7 @@
 namespace {
 
 QNCPointer<QNCBuffer> makeBuffer(unsigned int aUseLength, unsigned int aMaxLength) {
-  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aUseLength, aMaxLength),
-                               QNPST_Individual, QNPAT_New);
+  return QNCPointer<QNCBuffer>(new (std::nothrow) QNCAllocatedBuffer(aUseLength, aMaxLength));
 }
 
 TEST(BufferTest, LengthMovesWithinTheCapacityTheBytesStayAndNothingBeyondIsReachable) {
@@ -229,15 +228,15 @@ class ChannelTest : public ::testing::Test {
 // then the body; sizes around the staging buffer's.
 TEST_F(ChannelTest, FramedMessagesRoundTripOverASocketPairAndAPipe) {
   // Without the prefix, as a reader given the size expects it.
-  QNCPointer<QNCWriter> lBare(new QNCFdWriter(mPair[1], false), QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCWriter> lBare(new QNCFdWriter(mPair[1], false));
   QNCProtocolHelper(0).write(lBare, bufferOf({7, 8, 9}), true);
   char lRaw[8];
   EXPECT_EQ(3, read(mPair[0], lRaw, sizeof lRaw)) << "a prefix was sent";
   int lPipe[2];
   ASSERT_EQ(0, pipe(lPipe));
   for (const auto& lrEnds : {std::make_pair(mPair[0], dup(mPair[1])), std::make_pair(lPipe[0], lPipe[1])}) {
-    QNCPointer<QNCReader> lReader(new QNCFdReader(lrEnds.first), QNPST_Individual, QNPAT_New);
-    QNCPointer<QNCWriter> lWriter(new QNCFdWriter(lrEnds.second), QNPST_Individual, QNPAT_New);
+    QNCPointer<QNCReader> lReader(new QNCFdReader(lrEnds.first));
+    QNCPointer<QNCWriter> lWriter(new QNCFdWriter(lrEnds.second));
     QNCProtocolHelper lHelper(10);
     std::thread lProducer([&] {
       for (unsigned int i = 0; i < 60; ++i) lHelper.write(lWriter, bufferOf(message(i)), false);
@@ -256,7 +255,7 @@ TEST_F(ChannelTest, FramedMessagesRoundTripOverASocketPairAndAPipe) {
 // message that arrives in between is read whole. Without the sleep the attempts run out first.
 TEST_F(ChannelTest, TryAgainIsRetriedAfterTheRetryTimeUpTo301Attempts) {
   auto* lpReader = new CountingReader(mPair[0]);
-  QNCPointer<QNCReader> lReader(lpReader, QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCReader> lReader(lpReader);
   std::thread lLate([&] {
     std::this_thread::sleep_for(150ms);
     ASSERT_EQ(7, write(mPair[1], "\3\0\0\0abc", 7));
@@ -338,7 +337,7 @@ class KeepingWriter : public QNCWriter {
 
 TEST(ProtocolPrefixTest, PrefixesAWriterKeptStayAsTheyWereWritten) {
   auto* lpWriter = new KeepingWriter;
-  QNCPointer<QNCWriter> lWriter(lpWriter, QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCWriter> lWriter(lpWriter);
   for (const unsigned int lLength : {3u, 5u})
     QNCProtocolHelper(0).write(lWriter, bufferOf(Bytes(lLength, 1)), false);
   ASSERT_EQ(4u, lpWriter->mKept.size());

@@ -37,8 +37,8 @@ using qntest::thrown;
 // An object that records its destruction; an optional hook runs inside the destructor, so a
 // test can look at the world at the moment the object dies.
 struct QNSTracked {
-  static std::vector<int> sDestroyed;
-  static std::function<void(int)> sOnDestroy;
+  inline static std::vector<int> sDestroyed;
+  inline static std::function<void(int)> sOnDestroy;
   explicit QNSTracked(int aId = 0) : mId(aId) {}
   virtual ~QNSTracked() {
     sDestroyed.push_back(mId);
@@ -46,8 +46,6 @@ struct QNSTracked {
   }
   int mId;
 };
-std::vector<int> QNSTracked::sDestroyed;
-std::function<void(int)> QNSTracked::sOnDestroy;
 
 // Its destructor records the negated id before the base part records the id itself.
 struct QNSDerivedTracked : QNSTracked {
@@ -69,7 +67,7 @@ class PointerTest : public ::testing::Test {
     QNSTracked::sOnDestroy = nullptr;
   }
   static QNCPointer<QNSTracked> make(int aId) {
-    return QNCPointer<QNSTracked>(new (std::nothrow) QNSTracked(aId), QNPST_Individual, QNPAT_New);
+    return QNCPointer<QNSTracked>(new (std::nothrow) QNSTracked(aId));
   }
   static std::vector<int>& destroyed() { return QNSTracked::sDestroyed; }
 };
@@ -112,9 +110,9 @@ TEST_F(PointerTest, OnlyTheLastReferenceDestroysTheObject) {
 // head, and the old head owned the source, so the fields came from freed memory.
 TEST_F(PointerTest, AssigningFromAMemberOfTheReleasedObject) {
   {
-    QNCPointer<QNSNode> lHead(new (std::nothrow) QNSNode(1), QNPST_Individual, QNPAT_New);
-    lHead->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(2), QNPST_Individual, QNPAT_New);
-    lHead->mNext->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(3), QNPST_Individual, QNPAT_New);
+    QNCPointer<QNSNode> lHead(new (std::nothrow) QNSNode(1));
+    lHead->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(2));
+    lHead->mNext->mNext = QNCPointer<QNSNode>(new (std::nothrow) QNSNode(3));
     lHead = lHead->mNext;
     EXPECT_EQ(2, lHead->mTracked.mId);
     lHead = std::move(lHead->mNext);
@@ -132,8 +130,7 @@ TEST_F(PointerTest, ArraysAndDerivedObjectsAreDestroyedWhole) {
   QNCPointer<QNSTracked>(lpArray, QNPST_Array, QNPAT_New).reset();
   EXPECT_EQ((std::vector<int>{3, 2, 1}), destroyed());
   destroyed().clear();
-  auto* lpDerived =
-      new QNCPointer<QNSDerivedTracked>(new (std::nothrow) QNSDerivedTracked, QNPST_Individual, QNPAT_New);
+  auto* lpDerived = new QNCPointer<QNSDerivedTracked>(new (std::nothrow) QNSDerivedTracked);
   QNCPointer<QNSTracked> lBase(*lpDerived);
   delete lpDerived;
   EXPECT_TRUE(destroyed().empty());
@@ -162,7 +159,7 @@ TEST_F(PointerTest, CopiesReleasedOnManyThreadsDestroyTheObjectOnce) {
 // An element whose copies fail with std::bad_alloc on request, as an allocation inside a copy
 // would; the containers must turn that into their own exception and stay unchanged.
 struct QNSFragile {
-  static bool sFailCopies;
+  inline static bool sFailCopies = false;
   explicit QNSFragile(int aValue) : mValue(aValue) {}
   QNSFragile(const QNSFragile& acrOther) : mValue(acrOther.mValue) {
     if (sFailCopies) throw std::bad_alloc();
@@ -176,7 +173,6 @@ struct QNSFragile {
   QNSFragile& operator=(QNSFragile&&) noexcept = default;
   int mValue;
 };
-bool QNSFragile::sFailCopies = false;
 
 // The same, default-constructible as well: a queue recycles its nodes for it, and a copy into a
 // recycled node must fail like a fresh allocation.
@@ -345,7 +341,6 @@ class InterruptingSignal {
     struct sigaction lAction = {};
     lAction.sa_handler = countSignal;
     sigemptyset(&lAction.sa_mask);
-    lAction.sa_flags = 0;
     sigaction(SIGUSR1, &lAction, &mPrevious);
   }
   ~InterruptingSignal() { sigaction(SIGUSR1, &mPrevious, nullptr); }

@@ -112,10 +112,9 @@ TEST_F(LoggerTest, UrgentLinesWriteThroughAndAForkedChildDoesNotRepeatTheParents
 // (Lines before CreateLogger: the driver's and qnsensord's start-up, the death tests.)
 class LoggerProcessTest : public ::testing::Test {
  protected:
-  int run(const std::string& acrMode, const std::string& acrLog, const std::string& acrExtra = "") {
-    std::vector<std::string> lArgs{"log-" + acrMode, acrLog};
-    if (!acrExtra.empty()) lArgs.push_back(acrExtra);
-    return qntest::waitExit(qntest::spawnHelper(lArgs, mDir.file("stdout"), mDir.file("stderr")));
+  // The helper's exit status for the log- mode and its arguments.
+  int run(const std::vector<std::string>& acrArgs) {
+    return qntest::waitExit(qntest::spawnHelper(acrArgs, mDir.file("stdout"), mDir.file("stderr")));
   }
 
   qntest::TempDir mDir;
@@ -126,7 +125,7 @@ class LoggerProcessTest : public ::testing::Test {
 // every buffered line and does not deadlock against the logging thread. (An assertion's exit
 // writes its urgent "-H-" line, and the buffer with it, before that: the death tests.)
 TEST_F(LoggerProcessTest, ExitWritesEveryBufferedLine) {
-  ASSERT_EQ(1, run("exit", mLog));
+  ASSERT_EQ(1, run({"log-exit", mLog}));
   const std::string lLog = qntest::readFile(mLog);
   for (int lIndex = 0; lIndex < 1000; ++lIndex)
     ASSERT_EQ(1u, countOf(lLog, ") line " + std::to_string(lIndex) + "\n")) << "line " << lIndex;
@@ -137,7 +136,7 @@ TEST_F(LoggerProcessTest, CrashSignalWritesTheBufferAndStillKillsTheProcess) {
   for (const int lSignal : {SIGSEGV, SIGBUS, SIGABRT, SIGFPE}) {
     SCOPED_TRACE(strsignal(lSignal));
     const std::string lLog = mDir.file("crash" + std::to_string(lSignal) + ".log");
-    EXPECT_EQ(128 + lSignal, run("crash", lLog, std::to_string(lSignal)));
+    EXPECT_EQ(128 + lSignal, run({"log-crash", lLog, std::to_string(lSignal)}));
     const std::string lText = qntest::readFile(lLog);
     EXPECT_EQ(101u, linesOf(lText).size());
     EXPECT_EQ(1u, countOf(lText, ") line 99\n"));

@@ -55,9 +55,7 @@ class InstanceTest : public ::testing::Test {
     std::vector<std::string> lArgs = {acrMode, mPidFile, lTool.mLog};
     if (!acrGo.empty()) lArgs.push_back(acrGo);
     lTool.mChild = qntest::Child(qntest::spawnHelper(lArgs, lTool.mOut, lTool.mErr));
-    if (!acrReady.empty()) {
-      EXPECT_TRUE(qntest::waitForText(lTool.mOut, acrReady)) << readFile(lTool.mErr);
-    }
+    EXPECT_TRUE(acrReady.empty() || qntest::waitForText(lTool.mOut, acrReady)) << readFile(lTool.mErr);
     return lTool;
   }
 

@@ -369,13 +369,10 @@ TEST(MisuseDeathTest, EveryBrokenConditionIsAnAssertion) {
 // A system class that lacks a member an operation needs still ends by the pointer's assertion
 // (status 1), but an error line names the member and where to set it first: without it, the
 // newcomer sees only "Assertion [ 0 != mPointer ] failed" at Pointer.h. (A missing instance
-// manager or version at start-up: the Consumer.newcomer test.) BareSystem sets none of the
-// members the application must provide.
-class BareSystem : public QNCSystem {
+// manager or version at start-up: the Consumer.newcomer test.) The tests' system object has no
+// buffer manager; this one can lose its exit lock as well.
+class BareSystem : public qntest::TableSystem {
  public:
-  void setCommandLineArgumentDesc() override {}
-  void parseConfigFile(QNCString&) override {}
-  void displayHelp() override {}
   void dropExitLock() { mExitLock = QNCPointer<QNCMutex>(); }
 };
 

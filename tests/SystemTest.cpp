@@ -106,10 +106,9 @@ TEST(ThreadComponentTest, LifecycleStatesAndRepeatedCalls) {
   ScriptedComponent lComponent([&](ScriptedComponent& arSelf) {
     lSeen += arSelf.isExitRequested() ? 100 : 1;
     lSeen += arSelf.waitForExitRequest(1) ? 100 : 1;
-    lSeen += qntest::thrown<QNCInvalidEx>([&] { arSelf.waitForExit(); }) == "(nothing thrown)" ? 100 : 1;
+    lSeen += thrown<QNCInvalidEx>([&] { arSelf.waitForExit(); }) == "(nothing thrown)" ? 100 : 1;
   });
-  EXPECT_EQ("Thread 'scripted' was never started",
-            qntest::thrown<QNCInvalidEx>([&] { lComponent.requestExit(); }));
+  EXPECT_EQ("Thread 'scripted' was never started", thrown<QNCInvalidEx>([&] { lComponent.requestExit(); }));
   lComponent.waitForExit();  // never started: returns at once
   lComponent.init();
   EXPECT_THROW(lComponent.init(), QNCInvalidEx);
@@ -159,7 +158,7 @@ TEST(ThreadPoolTest, FinishWhileTasksRunDrainsTheQueueAndRefusesLaterTasks) {
       if (!lByDestructor) {
         lPool.finish();
         EXPECT_EQ("ThreadPool 'drain' is finished: task refused",
-                  qntest::thrown<QNCExitConditionEx>([&] { lPool.submit([] {}); }));
+                  thrown<QNCExitConditionEx>([&] { lPool.submit([] {}); }));
       }
       lGate.set_value();
     }
@@ -171,16 +170,15 @@ TEST(ThreadPoolTest, FinishWhileTasksRunDrainsTheQueueAndRefusesLaterTasks) {
 // too; the task blocked on that lock and the join never finished.
 TEST(ThreadPoolTest, MisuseIsRefusedWithClearErrors) {
   EXPECT_EQ("ThreadPool 'none' needs at least one thread",
-            qntest::thrown<QNCInvalidEx>([] { QNCThreadPool lEmpty("none", 0); }));
+            thrown<QNCInvalidEx>([] { QNCThreadPool lEmpty("none", 0); }));
   std::atomic<int> lRefused{0};
   QNCThreadPool lPool("self", 1);
   EXPECT_THROW(lPool.submit(QNCThreadPool::QNTTask()), QNCInvalidEx);
   lPool.waitForThreads();  // never started: returns at once
   lPool.init();
   EXPECT_THROW(lPool.init(), QNCInvalidEx);
-  lPool.submit([&] {
-    lRefused += qntest::thrown<QNCInvalidEx>([&] { lPool.waitForThreads(); }) != "(nothing thrown)";
-  });
+  lPool.submit(
+      [&] { lRefused += thrown<QNCInvalidEx>([&] { lPool.waitForThreads(); }) != "(nothing thrown)"; });
   lPool.finish();
   lPool.finish();  // idempotent
   lPool.waitForThreads();
@@ -214,8 +212,8 @@ class ThreadFailureTest : public qntest::LoggedTest {
 // Two failures, each restarted by the override: the third run serves until the exit request; the
 // run has not failed and nobody asked for an exit.
 TEST_F(ThreadFailureTest, OverrideRestartsTheWork) {
-  qntest::ScriptedComponent* lpComponent = &mSystem.addComponent(new qntest::ScriptedComponent(
-      [](qntest::ScriptedComponent& arSelf) {
+  ScriptedComponent* lpComponent = &mSystem.addComponent(new ScriptedComponent(
+      [](ScriptedComponent& arSelf) {
         if (arSelf.mRuns.load() <= 2) throw std::runtime_error("sensor bus gone");
         while (!arSelf.waitForExitRequest(1000)) {
         }
@@ -259,8 +257,8 @@ TEST_F(ThreadFailureTest, FailingPoolTaskFailsTheRun) {
 // --- The system starting and stopping its threads. A component refuses exit requests with the
 // exception it is given.
 template <class E>
-qntest::ScriptedComponent* refusing(const char* apName, std::atomic<int>& arRequests) {
-  auto* lpComponent = new qntest::ScriptedComponent([](qntest::ScriptedComponent&) {}, apName);
+ScriptedComponent* refusing(const char* apName, std::atomic<int>& arRequests) {
+  auto* lpComponent = new ScriptedComponent([](ScriptedComponent&) {}, apName);
   lpComponent->mRefuse = [&arRequests] {
     ++arRequests;
     throw E("cannot take the request", 6);
@@ -294,7 +292,7 @@ TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
   std::atomic<int> lRequests{0};  // outlives the system, whose destructor asks again
   ThreadsSystem lSystem;
   lSystem.addComponent(refusing<QNCInvalidEx>("alpha", lRequests));
-  auto& lWaiting = lSystem.addComponent(new qntest::ScriptedComponent({}, "beta"));
+  auto& lWaiting = lSystem.addComponent(new ScriptedComponent({}, "beta"));
   QNCThreadPool& lWorkers = lSystem.addPool("workers", 2);
   QNCThreadPool& lSpare = lSystem.addPool("spare", 1);
   EXPECT_FALSE(lSystem.isInited(0));
@@ -319,8 +317,8 @@ TEST_F(SystemTest, StartsAndWaitsInOrderAndTellsEveryThreadPastOneThatRefuses) {
 // components after it nor the pools are started: the service never runs without one of its threads.
 TEST_F(SystemTest, StartThreadsStopsAtTheFirstComponentThatCannotStart) {
   ThreadsSystem lSystem;
-  lSystem.addComponent(new qntest::ScriptedComponent({}, "first")).init();  // a second init() is refused
-  lSystem.addComponent(new qntest::ScriptedComponent({}, "second"));
+  lSystem.addComponent(new ScriptedComponent({}, "first")).init();  // a second init() is refused
+  lSystem.addComponent(new ScriptedComponent({}, "second"));
   QNCThreadPool& lPool = lSystem.addPool("late", 1);
   EXPECT_THROW(lSystem.startThreads(), QNCInvalidEx);
   EXPECT_FALSE(lSystem.isInited(1));
@@ -448,14 +446,14 @@ TEST_F(SettingsTest, IdentifiersAreReusedAndRefusalsLeaveTheLockFree) {
   mSystem.returnNumericId(3);
   mSystem.returnNumericId(1);
   EXPECT_EQ("Numeric identifier 0 is not in use, cannot return it",
-            qntest::thrown<QNCInvalidEx>([&] { mSystem.returnNumericId(0); }));
+            thrown<QNCInvalidEx>([&] { mSystem.returnNumericId(0); }));
   for (unsigned int lRefused : {1u, 4u}) EXPECT_THROW(mSystem.returnNumericId(lRefused), QNCInvalidEx);
   EXPECT_EQ(3u, lNext());
   EXPECT_EQ(1u, lNext());
   EXPECT_EQ(4u, lNext());
   lId = 77;
   EXPECT_EQ("No numeric identifier is free: all of 1..4 are in use",
-            qntest::thrown<QNCNotFoundEx>([&] { mSystem.generateNumericId(lId); }));
+            thrown<QNCNotFoundEx>([&] { mSystem.generateNumericId(lId); }));
   EXPECT_EQ(77u, lId);
   mSystem.returnNumericId(2);
   EXPECT_EQ(2u, lNext());

@@ -84,7 +84,8 @@ int logger(const std::string& acrMode, int argc, char** argv) {
     while (!lStarted.load()) std::this_thread::yield();
     for (int lIndex = 0; lIndex < 1000; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
     exit(1);
-  } else if (acrMode == "log-crash" && argc > 3) {
+  }
+  if (acrMode == "log-crash" && argc > 3) {
     CreateLogger(lpLog);
     for (int lIndex = 0; lIndex < 100; ++lIndex) QN_LOG_TRACE("line %d", lIndex);
     QN_LOG_INFO("last line before the crash");
@@ -97,10 +98,8 @@ int logger(const std::string& acrMode, int argc, char** argv) {
     if (lSignal == SIGABRT) abort();
     raise(lSignal);
     return 4;  // the signal did not end the process
-  } else {
-    return 2;
   }
-  return 0;
+  return 2;
 }
 
 // A service built on the start-up and shut-down driver. Every lifecycle operation is overridden

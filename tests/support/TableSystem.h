@@ -16,13 +16,11 @@
 #include "Conditional.h"
 #include "ProcessInstanceManager.h"
 #include "QNException.h"
-#include "Reader.h"
 #include "SynchList.h"
 #include "SynchQueue.h"
 #include "System.h"
 #include "ThreadComponent.h"
 #include "ThreadPool.h"
-#include "Writer.h"
 
 namespace qntest {
 
@@ -136,17 +134,16 @@ class TableSystem : public QNCSystem {
   void addBucket(unsigned int aLength) { mMemoryBufferList.pushBack(aLength); }
   template <class T>
   T& addComponent(T* apComponent) {
-    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent, QNPST_Individual, QNPAT_New));
+    mThreadComponents.append(QNCPointer<QNCThreadComponent>(apComponent));
     return *apComponent;
   }
   QNCThreadPool& addPool(const char* apName, unsigned int aThreads) {
-    mThreadPools.append(
-        QNCPointer<QNCThreadPool>(new QNCThreadPool(apName, aThreads), QNPST_Individual, QNPAT_New));
+    mThreadPools.append(QNCPointer<QNCThreadPool>(new QNCThreadPool(apName, aThreads)));
     return *mThreadPools[mThreadPools.numberOfElements() - 1];
   }
   void usePidFile(const char* apPath) {
-    mProcessInstanceManager = QNCPointer<QNCProcessInstanceManager>(
-        new (std::nothrow) QNCProcessInstanceManager(apPath), QNPST_Individual, QNPAT_New);
+    mProcessInstanceManager =
+        QNCPointer<QNCProcessInstanceManager>(new (std::nothrow) QNCProcessInstanceManager(apPath));
   }
 
   QNCConditional& conditional(unsigned int aNumber) { return *mWaitConditionals[aNumber]; }

@@ -115,8 +115,7 @@ bool lockedByOther(const std::string& acrPath) {
 
 QNCPointer<QNCBuffer> bufferOf(const Bytes& acrBytes) {
   const unsigned int lLength = static_cast<unsigned int>(acrBytes.size());
-  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow) QNCAllocatedBuffer(lLength == 0 ? 1 : lLength, 0),
-                                QNPST_Individual, QNPAT_New);
+  QNCPointer<QNCBuffer> lBuffer(new (std::nothrow) QNCAllocatedBuffer(lLength == 0 ? 1 : lLength, 0));
   if (lLength != 0) memcpy(static_cast<unsigned char*>(*lBuffer), acrBytes.data(), lLength);
   lBuffer->setLength(lLength);
   return lBuffer;
