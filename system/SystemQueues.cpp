@@ -23,6 +23,19 @@ __attribute__((noinline)) QNEWaitStatus waitToTake(QNCSystem& arSystem, QNCCondi
       arConditional, acrTake, [&arSystem] { return arSystem.isSetForExit(); }, noLimitIfZero(aMaxWaitMs),
       false, apWaitTrace, apFunction, aTrace);
 }
+
+// The exit-aware take: one pass through the container's lock when it holds an element, else the
+// wait, whose test is the take itself, made under the conditional's lock so that no other consumer
+// comes between the test and the take. Conditional aConditionNo (asserted by the caller) is
+// reached only when the take waits.
+template <class Take>
+QNEWaitStatus takeOrWait(QNCSystem& arSystem, QNCVector<QNCPointer<QNCConditional>>& arConditionals,
+                         unsigned int aConditionNo, const Take& acrTake, unsigned int aMaxWaitMs,
+                         const char* apWaitTrace, const char* apFunction, bool aTrace) {
+  if (acrTake()) return QNWS_Ready;
+  return waitToTake(arSystem, *arConditionals[aConditionNo], acrTake, aMaxWaitMs, apWaitTrace, apFunction,
+                    aTrace);
+}
 }  // namespace
 
 // The shape of every numbered list and queue service: the trace level is read once, "Entered" is
@@ -207,14 +220,10 @@ QNEWaitStatus QNCSystem::waitOnEmptyQueueOrExit(unsigned int acConditionNo, unsi
 QNEWaitStatus QNCSystem::delistOrExit(unsigned int acConditionNo, unsigned int acListNo,
                                       unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement) {
   QN_WAIT_NUMBERED(acConditionNo, acListNo, mLists);
-  // tryDelist releases arElement's former object before it locks. The busy case first: one pass
-  // through the list's lock. Otherwise the take is the test itself, made under the conditional's
-  // lock, so no other consumer comes between the test and the take.
-  QNEWaitStatus lStatus = QNWS_Ready;
-  if (!lrElement.tryDelist(arElement))
-    lStatus = waitToTake(
-        *this, *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDelist(arElement); }, aMaxWaitMs,
-        "List empty... Going to wait on conditional", __func__, lTrace);
+  // tryDelist releases arElement's former object before it locks.
+  const QNEWaitStatus lStatus = takeOrWait(
+      *this, mWaitConditionals, acConditionNo, [&] { return lrElement.tryDelist(arElement); }, aMaxWaitMs,
+      "List empty... Going to wait on conditional", __func__, lTrace);
   QN_LEFT_IF(lTrace);
   return lStatus;
 }
@@ -223,11 +232,9 @@ QNEWaitStatus QNCSystem::dequeueOrExit(unsigned int acConditionNo, unsigned int 
                                        unsigned int aMaxWaitMs, QNCPointer<QNCQueueable>& arElement) {
   QN_WAIT_NUMBERED(acConditionNo, acQueueNo, mQueues);
   arElement.reset();  // tryDequeue does it too, but a derived queue may override it
-  QNEWaitStatus lStatus = QNWS_Ready;
-  if (!lrElement.tryDequeue(arElement))
-    lStatus = waitToTake(
-        *this, *mWaitConditionals[acConditionNo], [&] { return lrElement.tryDequeue(arElement); }, aMaxWaitMs,
-        "Queue empty... Going to wait on conditional", __func__, lTrace);
+  const QNEWaitStatus lStatus = takeOrWait(
+      *this, mWaitConditionals, acConditionNo, [&] { return lrElement.tryDequeue(arElement); }, aMaxWaitMs,
+      "Queue empty... Going to wait on conditional", __func__, lTrace);
   QN_LEFT_IF(lTrace);
   return lStatus;
 }
