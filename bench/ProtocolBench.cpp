@@ -265,18 +265,15 @@ const bool kRegistered = [] {
     benchmark::RegisterBenchmark((lPrefix + "/floor").c_str(), framedFloor, lSize.mSize)
         ->Iterations(lSize.mIterations);
   }
-  benchmark::RegisterBenchmark("Framing/roundtriptcp/ours", roundTripTcpOurs)
-      ->Iterations(4000)
-      ->UseRealTime();
-  benchmark::RegisterBenchmark("Framing/roundtriptcp/floor", roundTripTcpFloor)
-      ->Iterations(4000)
-      ->UseRealTime();
-  benchmark::RegisterBenchmark("Framing/roundtripunix/ours", roundTripUnixOurs)
-      ->Iterations(4000)
-      ->UseRealTime();
-  benchmark::RegisterBenchmark("Framing/roundtripunix/floor", roundTripUnixFloor)
-      ->Iterations(4000)
-      ->UseRealTime();
+  const struct {
+    const char* mpName;
+    void (*mpRun)(benchmark::State&);
+  } lRoundTrips[] = {{"Framing/roundtriptcp/ours", roundTripTcpOurs},
+                     {"Framing/roundtriptcp/floor", roundTripTcpFloor},
+                     {"Framing/roundtripunix/ours", roundTripUnixOurs},
+                     {"Framing/roundtripunix/floor", roundTripUnixFloor}};
+  for (const auto& lRoundTrip : lRoundTrips)
+    benchmark::RegisterBenchmark(lRoundTrip.mpName, lRoundTrip.mpRun)->Iterations(4000)->UseRealTime();
   return true;
 }();
 
